@@ -1,0 +1,186 @@
+#include "alertmod/manager/notify_manager.h"
+
+#include <algorithm>
+#include <atomic>
+#include <cstdio>
+#include <exception>
+
+#include "alertmod/diag/log.h"
+#include "alertmod/platform/clock.h"
+
+namespace hx {
+namespace {
+
+constexpr std::chrono::milliseconds kDefaultWatchdogPeriod{10000};
+constexpr std::chrono::milliseconds kRetryPollInterval{100};
+
+std::atomic<int64_t> g_watchdogPeriodMs{kDefaultWatchdogPeriod.count()};
+
+}  // namespace
+
+void SNOTIFY_CALLBACK::OnReady() { m_manager->MoveToReady(this); }
+
+NotifyManager::NotifyManager(core::HostCallbackFn callback, WorkerJobFactory jobFactory)
+    : m_callback(callback),
+      m_jobFactory(std::move(jobFactory)),
+      m_watchdogPeriod(g_watchdogPeriodMs.load()) {
+  GetLgr()->SetFileName("notifylog.txt");
+}
+
+NotifyManager::~NotifyManager() = default;
+
+void NotifyManager::SetWatchdogPeriod(std::chrono::milliseconds period) {
+  g_watchdogPeriodMs.store(period.count());
+}
+
+void NotifyManager::QueueWorkItem(std::shared_ptr<NotifyWorkItem> item, bool atFront) {
+  {
+    std::lock_guard<std::mutex> lock(m_queueMutex);
+    if (atFront) {
+      m_workQueue.push_front(std::move(item));
+    } else {
+      m_workQueue.push_back(std::move(item));
+    }
+  }
+  m_queueSignal.notify_one();
+}
+
+void NotifyManager::Stop() {
+  QueueWorkItem(std::make_shared<NotifyWorkItem>(kWorkItemStop), true);
+}
+
+size_t NotifyManager::QueuedCount() const {
+  std::lock_guard<std::mutex> lock(m_queueMutex);
+  return m_workQueue.size();
+}
+
+void NotifyManager::PublishWorkerSettings(const WorkerSettings& settings) {
+  std::lock_guard<std::mutex> lock(m_queueMutex);
+  m_workerSettings = settings;
+  m_settingsChanged = true;
+}
+
+bool NotifyManager::TakeSettingsChange(WorkerSettings* settings) {
+  std::lock_guard<std::mutex> lock(m_queueMutex);
+  *settings = m_workerSettings;
+  bool changed = m_settingsChanged;
+  m_settingsChanged = false;
+  return changed;
+}
+
+std::shared_ptr<NotifyWorkItem> NotifyManager::TakeItem(const IWorkerJob& job) {
+  std::unique_lock<std::mutex> lock(m_queueMutex);
+  if (job.HasPendingRetries()) {
+    // Retries must run even when no notification arrives, so the worker
+    // polls; a new item still ends the wait at once.
+    m_queueSignal.wait_for(lock, kRetryPollInterval, [this] { return !m_workQueue.empty(); });
+    if (m_workQueue.empty()) return nullptr;
+  } else {
+    m_queueSignal.wait(lock, [this] { return !m_workQueue.empty(); });
+  }
+  std::shared_ptr<NotifyWorkItem> item = std::move(m_workQueue.front());
+  m_workQueue.pop_front();
+  return item;
+}
+
+void NotifyManager::RunItem(IWorkerJob& job, NotifyWorkItem& item) {
+  // A failing job must not end the worker: the next item is still sent.
+  try {
+    job.Run(item);
+  } catch (const std::exception& e) {
+    LogToHost(core::kModuleId, m_callback, LogLevelError,
+              "Notification for profile %s failed unexpectedly: %s",
+              item.profile.description.c_str(), e.what());
+  } catch (...) {
+    LogToHost(core::kModuleId, m_callback, LogLevelError,
+              "Notification for profile %s failed unexpectedly",
+              item.profile.description.c_str());
+  }
+}
+
+void NotifyManager::RunWorker() {
+  {
+    std::lock_guard<std::mutex> lock(m_stopMutex);
+    if (m_stopped) return;
+  }
+  WorkerSettings settings;
+  TakeSettingsChange(&settings);
+  std::unique_ptr<IWorkerJob> job = m_jobFactory();
+  job->Start(settings);
+  for (;;) {
+    std::shared_ptr<NotifyWorkItem> item = TakeItem(*job);
+    if (TakeSettingsChange(&settings)) job->OnConfigurationChanged(settings);
+    if (!item) {
+      job->RetryPass();
+      continue;
+    }
+    if (item->type == kWorkItemStop) break;
+    RunItem(*job, *item);
+  }
+  job->Stop();
+  job.reset();
+  MarkStopped();
+}
+
+void NotifyManager::MarkStopped() {
+  {
+    std::lock_guard<std::mutex> lock(m_stopMutex);
+    m_stopped = true;
+  }
+  m_stopSignal.notify_all();
+}
+
+void NotifyManager::RunWatchdog() {
+  std::unique_lock<std::mutex> lock(m_stopMutex);
+  while (!m_stopped) {
+    // A monotonic deadline: a change of the wall clock must not stop or
+    // hurry the ticks.
+    auto deadline = std::chrono::steady_clock::now() + m_watchdogPeriod;
+    if (m_stopSignal.wait_until(lock, deadline, [this] { return m_stopped; })) break;
+    lock.unlock();
+    SendTick();
+    lock.lock();
+  }
+}
+
+void NotifyManager::SendTick() {
+  if (m_callback == nullptr) return;
+  core::HostRequest tick =
+      core::MakeHostRequest(core::kModuleId, core::kClassWatchdogTick, core::kCodeTick);
+  int32_t result = m_callback(&tick, nullptr);
+  if (result != 0) {
+    fprintf(stderr, "Alertmod: watch dog event ret %d", result);
+    fflush(stderr);
+  }
+}
+
+void NotifyManager::OnTick() {
+  int64_t now = platform::WallSeconds();
+  auto due = [now](const std::shared_ptr<SNOTIFY_CALLBACK>& c) { return c->m_deadline < now; };
+  auto firstKept = std::stable_partition(m_pending.begin(), m_pending.end(), due);
+  m_ready.insert(m_ready.end(), m_pending.begin(), firstKept);
+  m_pending.erase(m_pending.begin(), firstKept);
+  if (!m_ready.empty()) ReleaseReady();
+}
+
+void NotifyManager::MoveToReady(const SNOTIFY_CALLBACK* callback) {
+  auto found = std::find_if(m_pending.begin(), m_pending.end(),
+                            [callback](const auto& c) { return c.get() == callback; });
+  if (found == m_pending.end()) return;
+  m_ready.push_back(std::move(*found));
+  m_pending.erase(found);
+}
+
+void NotifyManager::Park(std::shared_ptr<SNOTIFY_CALLBACK> callback) {
+  m_pending.push_back(std::move(callback));
+}
+
+void NotifyManager::ReleaseReady() {
+  while (!m_ready.empty()) {
+    std::shared_ptr<SNOTIFY_CALLBACK> callback = m_ready.front();
+    QueueWorkItem(callback->m_item, false);
+    m_ready.erase(m_ready.begin());
+  }
+}
+
+}  // namespace hx

@@ -1,0 +1,133 @@
+// NotifyManager is the module's one central object. It owns the work queue
+// that feeds the worker, the notifications that wait for their video, and
+// (through the parts that fill it) the configuration, the host system
+// catalogue, the video buffer and the throttle table.
+//
+// Threads. The host lends two threads: one runs RunWorker() and one runs
+// RunWatchdog(); both stay inside until the manager stops. Every other call
+// comes from host threads: Write and IOCTL code 2 arrive one at a time, so the
+// pending list, the ready list and the other host-side state take no lock. The
+// work queue and the stopped flag are guarded by their own locks, and
+// QueueWorkItem() and Stop() may be called from any thread.
+#ifndef ALERTMOD_MANAGER_NOTIFY_MANAGER_H_
+#define ALERTMOD_MANAGER_NOTIFY_MANAGER_H_
+
+#include <chrono>
+#include <condition_variable>
+#include <cstdint>
+#include <deque>
+#include <memory>
+#include <mutex>
+#include <vector>
+
+#include "alertmod/host_records.h"
+#include "alertmod/mail/notify_work_item.h"
+#include "alertmod/manager/worker_job.h"
+#include "alertmod/video/notify_ready.h"
+
+namespace hx {
+
+class NotifyManager;
+
+// A notification that waits for its video. The video capture holds it as an
+// INotifyReady and may keep it longer than the pending list does.
+struct SNOTIFY_CALLBACK final : public INotifyReady {
+  SNOTIFY_CALLBACK(NotifyManager* manager, std::shared_ptr<NotifyWorkItem> item, int64_t deadline)
+      : m_manager(manager), m_item(std::move(item)), m_deadline(deadline) {}
+
+  // Moves this notification from the pending list to the ready list; does
+  // nothing when it is no longer pending. The next ReleaseReady() queues it.
+  void OnReady() override;
+
+  NotifyManager* m_manager;
+  std::shared_ptr<NotifyWorkItem> m_item;
+  int64_t m_deadline;  // seconds since 1970
+};
+
+class NotifyManager {
+ public:
+  // `callback` reaches the host; `jobFactory` makes the job of each worker run.
+  NotifyManager(core::HostCallbackFn callback, WorkerJobFactory jobFactory);
+  ~NotifyManager();
+
+  NotifyManager(const NotifyManager&) = delete;
+  NotifyManager& operator=(const NotifyManager&) = delete;
+
+  // Puts `item` at the head of the work queue when `atFront`, else at the
+  // tail, and wakes the worker. Any thread.
+  void QueueWorkItem(std::shared_ptr<NotifyWorkItem> item, bool atFront);
+
+  // Queues a stop item at the head. The worker finishes its current item and
+  // then leaves its loop. Any thread; does not wait.
+  void Stop();
+
+  // The worker loop. Returns after the stop item, or at once when the worker
+  // has stopped before.
+  void RunWorker();
+
+  // The watchdog loop: asks the host for a tick every period. Returns when the
+  // worker has stopped.
+  void RunWatchdog();
+
+  // The host's answer to a tick: releases notifications whose deadline passed.
+  void OnTick();
+
+  // Queues every ready notification, finishing its capture streams first.
+  void ReleaseReady();
+
+  // Parks a notification in the pending list until its video is complete or
+  // its deadline has passed. Host threads only.
+  void Park(std::shared_ptr<SNOTIFY_CALLBACK> callback);
+
+  // Host-thread entry points of the parts built on the manager.
+  void Open();
+  bool OnFrame(uint32_t streamId, uint8_t frameType, uint32_t payloadOffset, const void* data,
+               uint32_t length);
+  void OnAlarmDocument(const void* data, uint32_t length);
+  void OnHostDocument(const void* data, uint32_t length);
+
+  // Hands new retry settings to the worker, which applies them before its next
+  // item. Any thread.
+  void PublishWorkerSettings(const WorkerSettings& settings);
+
+  // The watchdog's period for managers created from now on (default 10 s).
+  static void SetWatchdogPeriod(std::chrono::milliseconds period);
+
+  core::HostCallbackFn Callback() const { return m_callback; }
+
+  // Read access for tests and the parts built on the manager.
+  size_t PendingCount() const { return m_pending.size(); }
+  size_t ReadyCount() const { return m_ready.size(); }
+  size_t QueuedCount() const;
+
+ private:
+  friend struct SNOTIFY_CALLBACK;
+
+  void MoveToReady(const SNOTIFY_CALLBACK* callback);
+  std::shared_ptr<NotifyWorkItem> TakeItem(const IWorkerJob& job);
+  bool TakeSettingsChange(WorkerSettings* settings);
+  void RunItem(IWorkerJob& job, NotifyWorkItem& item);
+  void MarkStopped();
+  void SendTick();
+
+  const core::HostCallbackFn m_callback;
+  const WorkerJobFactory m_jobFactory;
+  const std::chrono::milliseconds m_watchdogPeriod;
+
+  mutable std::mutex m_queueMutex;
+  std::condition_variable m_queueSignal;
+  std::deque<std::shared_ptr<NotifyWorkItem>> m_workQueue;
+  WorkerSettings m_workerSettings;  // guarded by m_queueMutex
+  bool m_settingsChanged = false;   // guarded by m_queueMutex
+
+  std::vector<std::shared_ptr<SNOTIFY_CALLBACK>> m_pending;
+  std::vector<std::shared_ptr<SNOTIFY_CALLBACK>> m_ready;
+
+  std::mutex m_stopMutex;
+  std::condition_variable m_stopSignal;
+  bool m_stopped = false;  // guarded by m_stopMutex
+};
+
+}  // namespace hx
+
+#endif  // ALERTMOD_MANAGER_NOTIFY_MANAGER_H_

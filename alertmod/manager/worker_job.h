@@ -1,0 +1,48 @@
+// The work the manager's worker runs: one notification job per work item and
+// a retry pass when failed messages wait. The manager owns one IWorkerJob per
+// worker run and is its only caller, always on the worker thread.
+#ifndef ALERTMOD_MANAGER_WORKER_JOB_H_
+#define ALERTMOD_MANAGER_WORKER_JOB_H_
+
+#include <cstdint>
+#include <functional>
+#include <memory>
+
+#include "alertmod/host_records.h"
+#include "alertmod/mail/notify_work_item.h"
+
+namespace hx {
+
+// The configuration values the worker needs between items.
+struct WorkerSettings {
+  int32_t maxRetrySeconds = 172800;
+  int32_t maxRetryQueue = 100;
+};
+
+class IWorkerJob {
+ public:
+  virtual ~IWorkerJob() = default;
+  // Called once when the worker starts, before any other call.
+  virtual void Start(const WorkerSettings& settings) = 0;
+  // True while failed messages wait for a retry; the worker then polls
+  // instead of blocking on the queue.
+  virtual bool HasPendingRetries() const = 0;
+  // The configuration changed since the previous item.
+  virtual void OnConfigurationChanged(const WorkerSettings& settings) = 0;
+  // Runs one notification. May block for as long as delivery takes.
+  virtual void Run(NotifyWorkItem& item) = 0;
+  // Offers the retry queue one attempt.
+  virtual void RetryPass() = 0;
+  // Called once when the worker leaves its loop.
+  virtual void Stop() = 0;
+};
+
+using WorkerJobFactory = std::function<std::unique_ptr<IWorkerJob>()>;
+
+// The job the module runs in production, reporting to the host through
+// `callback`.
+WorkerJobFactory DefaultWorkerJobFactory(core::HostCallbackFn callback);
+
+}  // namespace hx
+
+#endif  // ALERTMOD_MANAGER_WORKER_JOB_H_

@@ -1,0 +1,53 @@
+#include "alertmod/platform/clock.h"
+
+#include <atomic>
+#include <ctime>
+
+namespace hx {
+namespace platform {
+namespace {
+
+// A replacement is a function and its context. They are swapped as one
+// pointer so that a reader never pairs a new function with an old context.
+template <typename Fn>
+struct Source {
+  Fn fn;
+  void* context;
+};
+
+std::atomic<const Source<TickSource>*> g_tickSource{nullptr};
+std::atomic<const Source<WallSource>*> g_wallSource{nullptr};
+
+uint32_t SystemTickMs() {
+  timespec now{};
+  clock_gettime(CLOCK_MONOTONIC, &now);
+  uint64_t ms = static_cast<uint64_t>(now.tv_sec) * 1000u + static_cast<uint64_t>(now.tv_nsec) / 1000000u;
+  return static_cast<uint32_t>(ms);
+}
+
+template <typename Fn>
+void Install(std::atomic<const Source<Fn>*>& slot, Fn fn, void* context) {
+  // Replaced sources are leaked on purpose: a reader on another thread may
+  // still be calling through the old one. Tests install a handful at most.
+  const Source<Fn>* next = fn ? new Source<Fn>{fn, context} : nullptr;
+  slot.store(next, std::memory_order_release);
+}
+
+}  // namespace
+
+uint32_t TickMs() {
+  const Source<TickSource>* source = g_tickSource.load(std::memory_order_acquire);
+  return source ? source->fn(source->context) : SystemTickMs();
+}
+
+int64_t WallSeconds() {
+  const Source<WallSource>* source = g_wallSource.load(std::memory_order_acquire);
+  return source ? source->fn(source->context) : static_cast<int64_t>(time(nullptr));
+}
+
+void SetTickSource(TickSource source, void* context) { Install(g_tickSource, source, context); }
+
+void SetWallSource(WallSource source, void* context) { Install(g_wallSource, source, context); }
+
+}  // namespace platform
+}  // namespace hx

@@ -1,0 +1,69 @@
+# Helpers that register tests. In a TSan build only tests marked THREADED are
+# built and registered, which keeps that build short.
+
+# alertmod_unit_tests(<library> [THREADED] [LIBS ...])
+# Builds every *_test.cpp beside the caller into <library>_test, linked with
+# <library> and GoogleMock, and registers each test case with CTest.
+function(alertmod_unit_tests library)
+  cmake_parse_arguments(ARG "THREADED" "" "LIBS" ${ARGN})
+  if(ALERTMOD_SANITIZE STREQUAL "thread" AND NOT ARG_THREADED)
+    return()
+  endif()
+  file(GLOB sources CONFIGURE_DEPENDS ${CMAKE_CURRENT_SOURCE_DIR}/*_test.cpp)
+  if(NOT sources)
+    return()
+  endif()
+  set(target ${library}_test)
+  add_executable(${target} ${sources})
+  target_link_libraries(${target} PRIVATE ${library} ${ARG_LIBS} alertmod_test_support_unit
+                        GTest::gmock GTest::gtest_main Threads::Threads)
+  set(labels unit)
+  if(ARG_THREADED)
+    list(APPEND labels threaded)
+  endif()
+  gtest_discover_tests(${target} DISCOVERY_MODE PRE_TEST
+                       PROPERTIES LABELS "${labels}" TIMEOUT 120)
+endfunction()
+
+# alertmod_integration_test(<name> SOURCES ... [THREADED] [LABELS ...])
+# A test program that drives the module through the reference host.
+function(alertmod_integration_test name)
+  cmake_parse_arguments(ARG "THREADED" "" "SOURCES;LABELS;LIBS" ${ARGN})
+  if(ALERTMOD_SANITIZE STREQUAL "thread" AND NOT ARG_THREADED)
+    return()
+  endif()
+  add_executable(${name} ${ARG_SOURCES})
+  target_link_libraries(${name} PRIVATE alertmod_test_support ${ARG_LIBS}
+                        GTest::gmock GTest::gtest_main Threads::Threads)
+  add_dependencies(${name} alertmod_testing alertmod)
+  set(labels integration ${ARG_LABELS})
+  if(ARG_THREADED)
+    list(APPEND labels threaded)
+  endif()
+  gtest_discover_tests(${name} DISCOVERY_MODE PRE_TEST
+                       PROPERTIES LABELS "${labels}" TIMEOUT 300)
+endfunction()
+
+# alertmod_subsystem(<library> DEPS ... [THREADED])
+# A subsystem's static library from every .cpp beside the caller that is not
+# a test, and its unit tests. A subsystem without sources yet is an interface
+# library.
+function(alertmod_subsystem library)
+  cmake_parse_arguments(ARG "THREADED" "" "DEPS" ${ARGN})
+  file(GLOB sources CONFIGURE_DEPENDS ${CMAKE_CURRENT_SOURCE_DIR}/*.cpp)
+  list(FILTER sources EXCLUDE REGEX "_test\\.cpp$")
+  if(sources)
+    add_library(${library} STATIC ${sources})
+    target_include_directories(${library} PUBLIC ${PROJECT_SOURCE_DIR})
+    target_link_libraries(${library} PUBLIC ${ARG_DEPS})
+  else()
+    add_library(${library} INTERFACE)
+    target_include_directories(${library} INTERFACE ${PROJECT_SOURCE_DIR})
+    target_link_libraries(${library} INTERFACE ${ARG_DEPS})
+  endif()
+  if(ARG_THREADED)
+    alertmod_unit_tests(${library} THREADED)
+  else()
+    alertmod_unit_tests(${library})
+  endif()
+endfunction()

@@ -1,0 +1,112 @@
+// ReferenceHost plays the recording server for one loaded alert module: it
+// answers the module's requests (log, watchdog tick, documents and the
+// services added beside it), lends the worker and watchdog threads, and makes
+// every Write and IOCTL code 2 call from its one dispatcher thread.
+//
+// One ReferenceHost may have a module loaded at a time in a process, because
+// the host callback is a plain function pointer. Its public methods may be
+// called from any thread; request handlers run on whichever module thread made
+// the request and must be thread-safe.
+#ifndef ALERTMOD_HOST_REFERENCE_HOST_H_
+#define ALERTMOD_HOST_REFERENCE_HOST_H_
+
+#include <atomic>
+#include <cstdint>
+#include <functional>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <thread>
+
+#include "alertmod/host_records.h"
+#include "host/dispatcher.h"
+#include "host/log_sink.h"
+#include "host/module_library.h"
+#include "host/request_log.h"
+
+namespace refhost {
+
+struct HostOptions {
+  std::string modulePath;
+  int32_t logThreshold = 25;
+  std::string logFile;          // empty: standard error
+  bool echoLog = true;          // write log lines as they come
+  bool recordRequests = true;   // keep every request in Requests()
+};
+
+class ReferenceHost {
+ public:
+  // Answers one request of one class. Runs on the requesting module thread.
+  using Handler = std::function<int32_t(hx::core::HostRequest& request)>;
+
+  explicit ReferenceHost(HostOptions options);
+  ~ReferenceHost();  // Stop()
+
+  ReferenceHost(const ReferenceHost&) = delete;
+  ReferenceHost& operator=(const ReferenceHost&) = delete;
+
+  // Loads the module file without calling into it, so that a test can set
+  // the testing module's hooks first. False with `error` filled when the file
+  // cannot be loaded or another host has a module loaded.
+  bool OpenLibrary(std::string* error);
+  // OpenLibrary when needed, then Load.
+  bool LoadModule(std::string* error);
+  // Calls Open on the dispatcher.
+  void OpenModule();
+  // Lends the worker (IOCTL code 1) and watchdog (Read mode 0) threads.
+  void LendThreads();
+  // LoadModule, OpenModule and LendThreads.
+  bool Start(std::string* error);
+  // Close, join the lent threads, drain the dispatcher, Unload. Idempotent.
+  void Stop();
+
+  // Write from the dispatcher. Returns the module's result and fills `out`.
+  int32_t Write(const hx::core::WriteParmsIn& in, hx::core::WriteParmsOut* out);
+  // Writes an XML document as if another module with id `sender` sent it.
+  void WriteDocument(const std::string& text, uint32_t sender);
+  // IOCTL from the calling thread (codes other than 2) or the dispatcher (2).
+  int32_t Ioctl(uint32_t code, const void* data, uint32_t length);
+  // IOCTL code 2 with `text` from the dispatcher.
+  void SendHostDocument(const std::string& text);
+
+  // Replaces the answer to one request class. Install before the module
+  // makes such requests.
+  void SetHandler(uint32_t requestClass, Handler handler);
+  // The result returned for watchdog ticks; a non-zero one is not answered.
+  void SetTickResult(int32_t result) { m_tickResult.store(result); }
+
+  // A hook of the testing module, or null for the production module.
+  void* Hook(const char* name) const;
+
+  RequestLog& Requests() { return m_requests; }
+  LogSink& Log() { return m_log; }
+  Dispatcher& GetDispatcher() { return *m_dispatcher; }
+  const hx::core::LoadParmsOut& LoadOut() const { return m_loadOut; }
+  bool Loaded() const { return m_module != nullptr; }
+
+ private:
+  static int32_t Callback(hx::core::HostRequest* request, void* reserved);
+  int32_t Handle(hx::core::HostRequest& request);
+  int32_t AnswerLog(const hx::core::HostRequest& request);
+  int32_t AnswerTick();
+  void InstallDefaultHandlers();
+
+  HostOptions m_options;
+  LogSink m_log;
+  RequestLog m_requests;
+  std::unique_ptr<ModuleLibrary> m_module;
+  bool m_loaded = false;
+  std::unique_ptr<Dispatcher> m_dispatcher;
+  hx::core::LoadParmsIn m_loadIn{};
+  hx::core::LoadParmsOut m_loadOut{};
+  std::thread m_worker;
+  std::thread m_watchdog;
+  std::atomic<int32_t> m_tickResult{0};
+  mutable std::mutex m_handlersMutex;
+  std::map<uint32_t, Handler> m_handlers;
+};
+
+}  // namespace refhost
+
+#endif  // ALERTMOD_HOST_REFERENCE_HOST_H_

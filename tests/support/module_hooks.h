@@ -1,0 +1,21 @@
+// The test hooks of the testing build of the module. The testing module is
+// the production module plus one more export, AlertmodTestHook(name), which
+// returns the hook registered under `name` or null. This header gives the
+// names and the function types; it includes nothing of the module.
+#ifndef ALERTMOD_TESTS_SUPPORT_MODULE_HOOKS_H_
+#define ALERTMOD_TESTS_SUPPORT_MODULE_HOOKS_H_
+
+#include <cstdint>
+
+namespace testhooks {
+
+// "SetTickSource": replaces the 32-bit millisecond tick (null restores).
+using SetTickSourceFn = void (*)(uint32_t (*source)(void* context), void* context);
+// "SetWallSource": replaces the wall clock in seconds (null restores).
+using SetWallSourceFn = void (*)(int64_t (*source)(void* context), void* context);
+// "SetWatchdogPeriodMs": the watchdog period of managers created afterwards.
+using SetWatchdogPeriodMsFn = void (*)(uint32_t periodMs);
+
+}  // namespace testhooks
+
+#endif  // ALERTMOD_TESTS_SUPPORT_MODULE_HOOKS_H_
