@@ -67,3 +67,25 @@ function(alertmod_subsystem library)
     alertmod_unit_tests(${library})
   endif()
 endfunction()
+
+# alertmod_fuzz_target(<name> SOURCES ... LIBS ... [CORPUS <dir>])
+# A libFuzzer target, built only in the clang ASan+UBSan build. scripts/fuzz
+# runs every target for a bounded time with its seed corpus (a directory of
+# files, relative to the caller's source directory).
+function(alertmod_fuzz_target name)
+  cmake_parse_arguments(ARG "" "CORPUS" "SOURCES;LIBS" ${ARGN})
+  if(NOT ALERTMOD_FUZZ)
+    return()
+  endif()
+  add_executable(${name} ${ARG_SOURCES})
+  target_compile_options(${name} PRIVATE -fsanitize=fuzzer)
+  target_link_options(${name} PRIVATE -fsanitize=fuzzer)
+  target_link_libraries(${name} PRIVATE ${ARG_LIBS})
+  set_target_properties(${name} PROPERTIES RUNTIME_OUTPUT_DIRECTORY ${CMAKE_BINARY_DIR}/fuzz)
+  if(ARG_CORPUS)
+    file(APPEND ${CMAKE_BINARY_DIR}/fuzz/targets.txt.new
+         "${name} ${CMAKE_CURRENT_SOURCE_DIR}/${ARG_CORPUS}\n")
+  else()
+    file(APPEND ${CMAKE_BINARY_DIR}/fuzz/targets.txt.new "${name} -\n")
+  endif()
+endfunction()
