@@ -79,11 +79,19 @@ bool ReferenceHost::Start(std::string* error) {
   return true;
 }
 
-void ReferenceHost::Stop() {
-  if (!m_module) return;
-  m_module->close();
+void ReferenceHost::CloseModule() {
+  if (m_module) m_module->close();
+}
+
+void ReferenceHost::JoinThreads() {
   if (m_worker.joinable()) m_worker.join();
   if (m_watchdog.joinable()) m_watchdog.join();
+}
+
+void ReferenceHost::Stop() {
+  if (!m_module) return;
+  CloseModule();
+  JoinThreads();
   m_dispatcher->Stop();
   m_module->unload();
   m_loaded = false;

@@ -58,6 +58,10 @@ class ReferenceHost {
   void LendThreads();
   // LoadModule, OpenModule and LendThreads.
   bool Start(std::string* error);
+  // Calls Close, which makes the module's lent threads return.
+  void CloseModule();
+  // Waits for the lent threads to return.
+  void JoinThreads();
   // Close, join the lent threads, drain the dispatcher, Unload. Idempotent.
   void Stop();
 

@@ -103,6 +103,12 @@ void NotifyManager::RunWorker() {
     std::lock_guard<std::mutex> lock(m_stopMutex);
     if (m_stopped) return;
   }
+  // However the loop ends, the watchdog must learn that the worker is gone.
+  struct StopMarker {
+    NotifyManager* manager;
+    ~StopMarker() { manager->MarkStopped(); }
+  } marker{this};
+
   WorkerSettings settings;
   TakeSettingsChange(&settings);
   std::unique_ptr<IWorkerJob> job = m_jobFactory();
@@ -118,8 +124,6 @@ void NotifyManager::RunWorker() {
     RunItem(*job, *item);
   }
   job->Stop();
-  job.reset();
-  MarkStopped();
 }
 
 void NotifyManager::MarkStopped() {
