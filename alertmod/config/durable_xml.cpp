@@ -1,9 +1,122 @@
 #include "alertmod/config/durable_xml.h"
 
+#include <atomic>
+
+#include "alertmod/platform/error_text.h"
+#include "alertmod/platform/files.h"
+
 namespace hx {
+namespace {
 
-bool SaveXmlDurably(const TiXmlDocument&, const std::string&, std::string*) { return false; }
+std::atomic<SideFileSyncedHook> g_sideFileSyncedHook{nullptr};
 
-bool LoadXmlDurably(TiXmlDocument&, const std::string&) { return false; }
+std::string PrintIndented(const TiXmlDocument& document) {
+  TiXmlPrinter printer;
+  printer.SetIndent("    ");
+  printer.SetLineBreak("\n");
+  document.Accept(&printer);
+  return printer.Str();
+}
+
+// Writes `text` into a freshly created side file and forces it to the
+// device. Returns the error text, empty on success. Only the first failure is
+// reported: a close error after a write error says nothing new.
+std::string WriteSideFile(const std::string& sideName, const std::string& text) {
+  int fd = -1;
+  if (int error = platform::CreateExclusiveFile(sideName, fd)) {
+    return "create error " + std::to_string(error);
+  }
+  std::string failure;
+  size_t written = 0;
+  if (int error = platform::WriteFully(fd, text.data(), text.size(), written)) {
+    failure = "write error " + std::to_string(error);
+  } else if (int error = platform::SyncFile(fd)) {
+    // Data that never reached the device was not written.
+    failure = "write error " + std::to_string(error);
+  } else if (SideFileSyncedHook hook = g_sideFileSyncedHook.load()) {
+    hook(sideName);
+  }
+  int closeError = platform::CloseFile(fd);
+  if (failure.empty() && closeError != 0) failure = "close error " + std::to_string(closeError);
+  if (failure.empty() && written < text.size()) {
+    failure =
+        "only wrote " + std::to_string(written) + " of " + std::to_string(text.size()) + " bytes";
+  }
+  return failure;
+}
+
+// A side file is adopted only when it holds a whole document: one cut short
+// right after its declaration parses without error but has no root element,
+// and adopting it would replace the configuration with nothing.
+bool LoadCompleteSideFile(TiXmlDocument& document, const std::string& sideName) {
+  return document.LoadFile(sideName) && document.RootElement() != nullptr;
+}
+
+}  // namespace
+
+FileNameGuard& FileNameGuard::Instance() {
+  // Never destroyed: a save may still run on a host thread while the
+  // library's static objects are torn down.
+  static FileNameGuard* guard = new FileNameGuard();
+  return *guard;
+}
+
+void FileNameGuard::Acquire(const std::string& name) {
+  std::unique_lock<std::mutex> lock(m_mutex);
+  m_released.wait(lock, [&] { return m_names.count(name) == 0; });
+  m_names.insert(name);
+}
+
+void FileNameGuard::Release(const std::string& name) {
+  {
+    std::lock_guard<std::mutex> lock(m_mutex);
+    m_names.erase(name);
+  }
+  m_released.notify_all();
+}
+
+void SetSideFileSyncedHook(SideFileSyncedHook hook) {
+  g_sideFileSyncedHook.store(hook);
+}
+
+bool SaveXmlDurably(const TiXmlDocument& document, const std::string& fileName,
+                    std::string* errorText) {
+  const std::string text = PrintIndented(document);
+  const std::string sideName = fileName + kPendingSuffix;
+  FileNameLock held(fileName);
+
+  // A side file left by an interrupted save would make the exclusive create
+  // fail; it is stale, since the name is ours now.
+  platform::RemoveFile(sideName);
+  std::string failure = WriteSideFile(sideName, text);
+  if (!failure.empty()) {
+    platform::RemoveFile(sideName);
+    if (errorText != nullptr) *errorText = failure;
+    return false;
+  }
+  if (int error = platform::RenameReplacing(sideName, fileName)) {
+    if (errorText != nullptr) {
+      *errorText = "Failed to rename .xml.pending to .xml file " + std::to_string(error) + " - " +
+                   platform::ErrorText(error);
+    }
+    return false;
+  }
+  // The rename is done; a failed directory sync only weakens durability
+  // against a power loss, and the file itself is complete either way.
+  platform::SyncParentDirectory(fileName);
+  return true;
+}
+
+bool LoadXmlDurably(TiXmlDocument& document, const std::string& fileName) {
+  const std::string sideName = fileName + kPendingSuffix;
+  FileNameLock held(fileName);
+  if (LoadCompleteSideFile(document, sideName)) {
+    if (platform::RenameReplacing(sideName, fileName) == 0) {
+      platform::SyncParentDirectory(fileName);
+    }
+    return true;
+  }
+  return document.LoadFile(fileName);
+}
 
 }  // namespace hx

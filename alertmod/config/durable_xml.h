@@ -2,24 +2,77 @@
 // (the name plus ".pending"), forces it to the storage device and renames it
 // over the target; a load adopts a complete side file left by an interrupted
 // save. A process-wide guard serialises threads that use the same file name.
+//
+// Any thread may call these functions; two calls with the same name wait for
+// each other, calls with different names run in parallel.
 #ifndef ALERTMOD_CONFIG_DURABLE_XML_H_
 #define ALERTMOD_CONFIG_DURABLE_XML_H_
 
+#include <condition_variable>
+#include <mutex>
+#include <set>
 #include <string>
 
 #include <tinyxml.h>
 
 namespace hx {
 
+// Suffix of the side file that a save writes before renaming it.
+constexpr const char kPendingSuffix[] = ".pending";
+
 // Prints `document` with four-space indentation and LF line ends and stores
 // it as `fileName`. False on failure, with the reason in `errorText` when
-// given; the target file is never damaged.
+// given; the target file is never damaged. The texts are "create error N",
+// "write error N", "close error N" (N the system error number), "only wrote
+// W of S bytes", and "Failed to rename .xml.pending to .xml file N - text",
+// which leaves the complete side file for the next load to adopt. The
+// document is const, so the reason cannot live in its error description.
 bool SaveXmlDurably(const TiXmlDocument& document, const std::string& fileName,
                     std::string* errorText = nullptr);
 
-// Reads and parses `fileName`, adopting a complete side file first. False
-// when no document could be read and parsed.
+// Reads and parses `fileName`, adopting a complete side file first (one that
+// parses and has a root element; it then replaces the target). False when no
+// document could be read and parsed; `document` then holds the parser's error.
 bool LoadXmlDurably(TiXmlDocument& document, const std::string& fileName);
+
+// The process-wide set of file names being loaded or saved. Names are exact
+// byte strings; two spellings of one path are two names.
+class FileNameGuard {
+ public:
+  static FileNameGuard& Instance();
+
+  // Waits until no other holder has `name`, then holds it.
+  void Acquire(const std::string& name);
+  // Gives `name` up and wakes its waiters. Requires that the caller holds it.
+  void Release(const std::string& name);
+
+ private:
+  FileNameGuard() = default;
+
+  std::mutex m_mutex;
+  std::condition_variable m_released;
+  std::set<std::string> m_names;
+};
+
+// Holds one name of the FileNameGuard for its scope.
+class FileNameLock {
+ public:
+  explicit FileNameLock(std::string name) : m_name(std::move(name)) {
+    FileNameGuard::Instance().Acquire(m_name);
+  }
+  ~FileNameLock() { FileNameGuard::Instance().Release(m_name); }
+  FileNameLock(const FileNameLock&) = delete;
+  FileNameLock& operator=(const FileNameLock&) = delete;
+
+ private:
+  std::string m_name;
+};
+
+// Test seam: called by a save after the side file reached the storage device
+// and before it is closed and renamed, with the side file's name, while the
+// name is held. Null (the default) calls nothing. Install before saving.
+using SideFileSyncedHook = void (*)(const std::string& sideFileName);
+void SetSideFileSyncedHook(SideFileSyncedHook hook);
 
 }  // namespace hx
 
