@@ -1,29 +1,281 @@
 #include "alertmod/hostsvc/process_service.h"
 
+#include <algorithm>
+#include <atomic>
+#include <cstring>
+#include <map>
+
 namespace hx {
 namespace ipc {
+namespace {
 
-void RegisterProcessService(uint32_t, SendFunction) {}
+// The one registry of the process: id to client, the last id issued, the
+// module id and the send function. The send function is read without the
+// lock, so that a sender never takes the registry lock after a client's.
+class ProcessRegistry final {
+ public:
+  static ProcessRegistry& Instance() {
+    // Never destroyed: host threads may deliver messages while the
+    // library's static objects are torn down.
+    static ProcessRegistry* registry = new ProcessRegistry();
+    return *registry;
+  }
 
-void ShutdownProcessService(bool) {}
+  std::mutex lock;
+  std::map<uint32_t, std::shared_ptr<client>> clients;
+  bool closed = false;
+  uint32_t lastId = 0;
+  uint32_t moduleId = 0;
+  std::atomic<SendFunction> send{nullptr};
 
-int OnProcessMessage(const void*, uint64_t) { return 0; }
+ private:
+  ProcessRegistry() = default;
+};
 
-bool SendProcessMessage(uint32_t, uint32_t, uint32_t, const void*, size_t) { return false; }
+// Every value of the counter is tried once before a start gives up.
+constexpr uint32_t kCounterAttempts = kIdCounterMask + 1;
 
-std::shared_ptr<client> StartProcess(const ProcessOptions&) {
+uint32_t ReadU32(const unsigned char* bytes) {
+  return uint32_t{bytes[0]} | uint32_t{bytes[1]} << 8 | uint32_t{bytes[2]} << 16 |
+         uint32_t{bytes[3]} << 24;
+}
+
+void WriteU32(unsigned char* bytes, uint32_t value) {
+  for (int i = 0; i < 4; ++i) bytes[i] = static_cast<unsigned char>(value >> (8 * i));
+}
+
+bool SendOne(SendFunction send, uint32_t id, uint32_t type, uint32_t value, const char* payload,
+             size_t length, std::vector<unsigned char>& message) {
+  message.resize(kMessageHeaderBytes + length);
+  WriteU32(message.data(), static_cast<uint32_t>(message.size()));
+  WriteU32(message.data() + 4, id);
+  WriteU32(message.data() + 8, type);
+  WriteU32(message.data() + 12, value);
+  if (length > 0) memcpy(message.data() + kMessageHeaderBytes, payload, length);
+  return send(message.data(), message.size());
+}
+
+// Appends output without its carriage returns, which may arrive in any
+// piece, so the buffers hold lines separated by line feeds only.
+void AppendOutput(std::string& buffer, const char* data, size_t length) {
+  buffer.reserve(buffer.size() + length);
+  std::remove_copy(data, data + length, std::back_inserter(buffer), '\r');
+}
+
+bool EndsInPs1(const std::string& program) {
+  static const char kSuffix[] = ".ps1";
+  constexpr size_t kSuffixLength = sizeof(kSuffix) - 1;
+  return program.size() > kSuffixLength &&
+         program.compare(program.size() - kSuffixLength, kSuffixLength, kSuffix) == 0;
+}
+
+std::string BuildStartPayload(const ProcessOptions& options) {
+  std::string payload;
+  if (options.flags & kFlagFirstText) payload.append(options.firstText).push_back('\0');
+  if (options.flags & kFlagSecondText) payload.append(options.secondText).push_back('\0');
+  for (size_t i = 0; i < options.arguments.size(); ++i) {
+    if (i > 0) payload.push_back('\0');
+    payload.append(options.arguments[i]);
+  }
+  return payload;
+}
+
+// Chooses the next id not in use. Requires the registry lock. False when
+// every id is taken.
+bool NextFreeId(ProcessRegistry& registry, uint32_t& id) {
+  for (uint32_t attempt = 0; attempt < kCounterAttempts; ++attempt) {
+    id = ((registry.lastId + 1) & kIdCounterMask) | (registry.moduleId << 4);
+    registry.lastId = id;
+    if (registry.clients.count(id) == 0) return true;
+  }
+  return false;
+}
+
+void SetState(client& process, int32_t state) {
+  std::lock_guard<std::mutex> lock(process.lock);
+  process.state = state;
+}
+
+}  // namespace
+
+void RegisterProcessService(uint32_t moduleId, SendFunction send) {
+  ProcessRegistry& registry = ProcessRegistry::Instance();
+  std::lock_guard<std::mutex> lock(registry.lock);
+  registry.moduleId = moduleId;
+  registry.send.store(send);
+  registry.closed = false;
+}
+
+void ShutdownProcessService(bool closed) {
+  ProcessRegistry& registry = ProcessRegistry::Instance();
+  std::lock_guard<std::mutex> lock(registry.lock);
+  for (auto& entry : registry.clients) {
+    client& process = *entry.second;
+    {
+      std::lock_guard<std::mutex> clientLock(process.lock);
+      // A run cut off here has no exit code; reporting 0 would read as
+      // success to a caller that then discards what the program was for.
+      if (process.state == kStateRunning || process.state == kStateStarting) {
+        process.state = kStateFailed;
+      }
+    }
+    process.condition.notify_all();
+  }
+  registry.clients.clear();
+  registry.closed = closed;
+}
+
+int OnProcessMessage(const void* data, uint64_t length) {
+  if (data == nullptr || length < kMessageHeaderBytes) return 0;
+  const auto* bytes = static_cast<const unsigned char*>(data);
+  const uint32_t id = ReadU32(bytes + 4);
+  const uint32_t type = ReadU32(bytes + 8);
+  const int32_t value = static_cast<int32_t>(ReadU32(bytes + 12));
+  const char* payload = reinterpret_cast<const char*>(bytes + kMessageHeaderBytes);
+  const size_t payloadLength = static_cast<size_t>(length - kMessageHeaderBytes);
+  if (type < kMessageOutput || type > kMessageExited) return 0;
+
+  ProcessRegistry& registry = ProcessRegistry::Instance();
+  std::lock_guard<std::mutex> lock(registry.lock);
+  auto found = registry.clients.find(id);
+  if (found == registry.clients.end()) return 0;
+  std::shared_ptr<client> process = found->second;
+  {
+    std::lock_guard<std::mutex> clientLock(process->lock);
+    switch (type) {
+      case kMessageOutput:
+        AppendOutput(process->standardOutput, payload, payloadLength);
+        break;
+      case kMessageErrorOutput:
+        AppendOutput(process->standardError, payload, payloadLength);
+        break;
+      case kMessageRunning:
+        process->value = value;
+        process->state = kStateRunning;
+        break;
+      default:  // failed or exited: the id is free again
+        process->value = value;
+        process->state = type == kMessageFailed ? kStateFailed : kStateExited;
+        registry.clients.erase(found);
+        break;
+    }
+    process->condition.notify_all();
+  }
+  return 1;
+}
+
+bool SendProcessMessage(uint32_t id, uint32_t type, uint32_t value, const void* data,
+                        size_t length) {
+  SendFunction send = ProcessRegistry::Instance().send.load();
+  if (send == nullptr || (data == nullptr && length > 0)) return false;
+  if (type != kMessageInput && length > kMessageMaxPayloadBytes) return false;
+  const char* bytes = static_cast<const char*>(data);
+  std::vector<unsigned char> message;
+  size_t offset = 0;
+  do {
+    size_t piece = std::min(length - offset, kMessageMaxPayloadBytes);
+    if (!SendOne(send, id, type, value, bytes + offset, piece, message)) return false;
+    offset += piece;
+  } while (offset < length);
+  return true;
+}
+
+std::shared_ptr<client> StartProcess(const ProcessOptions& options) {
   auto process = std::make_shared<client>();
-  process->state = kStateFailed;
+  if (options.arguments.empty()) {
+    process->state = kStateFailed;
+    return process;
+  }
+  if (!(options.flags & kFlagKeepInputAtWait) && EndsInPs1(options.arguments[0])) {
+    process->endInputAtWait = true;
+  }
+  const std::string payload = BuildStartPayload(options);
+  {
+    // The start is sent under the registry lock, so that the host's answer,
+    // which may come at once on another thread, finds the client registered.
+    ProcessRegistry& registry = ProcessRegistry::Instance();
+    std::lock_guard<std::mutex> lock(registry.lock);
+    uint32_t id = 0;
+    if (registry.closed || !NextFreeId(registry, id)) {
+      SetState(*process, kStateFailed);
+      return process;
+    }
+    process->id = id;
+    if (!SendProcessMessage(id, kMessageStart, options.flags, payload.data(), payload.size())) {
+      SetState(*process, kStateFailed);
+      return process;
+    }
+    registry.clients[id] = process;
+  }
+  std::unique_lock<std::mutex> lock(process->lock);
+  process->condition.wait(lock, [&] { return process->state != kStateStarting; });
   return process;
 }
 
-bool ReadOutputLine(client&, std::string&, int) { return false; }
+bool ReadOutputLine(client& process, std::string& line, int channel) {
+  if (channel != 0 && channel != 1) return false;
+  std::unique_lock<std::mutex> lock(process.lock);
+  std::string& buffer = channel == 0 ? process.standardOutput : process.standardError;
+  for (;;) {
+    std::string::size_type end = buffer.find('\n');
+    if (end != std::string::npos) {
+      line.assign(buffer, 0, end);
+      buffer.erase(0, end + 1);
+      return true;
+    }
+    if (process.state != kStateRunning) {
+      if (buffer.empty()) return false;
+      line.swap(buffer);
+      buffer.clear();
+      return true;
+    }
+    process.condition.wait(lock);
+  }
+}
 
-void WaitForExit(client&) {}
+void WaitForExit(client& process) {
+  std::unique_lock<std::mutex> lock(process.lock);
+  if (process.state == kStateRunning && process.endInputAtWait) {
+    process.endInputAtWait = false;
+    // Sent without the client's lock: the host may be delivering output for
+    // this client meanwhile, which needs it.
+    lock.unlock();
+    SendProcessMessage(process.id, kMessageInput, 1, nullptr, 0);
+    lock.lock();
+  }
+  process.condition.wait(lock, [&] { return process.state != kStateRunning; });
+}
 
-bool RunProcess(const std::vector<std::string>&, const std::string&, int32_t&,
-                std::vector<std::string>&) {
-  return false;
+bool RunProcess(const std::vector<std::string>& arguments, const std::string& input,
+                int32_t& exitCode, std::vector<std::string>& errorLines, std::string* output) {
+  ProcessOptions options;
+  options.arguments = arguments;
+  std::shared_ptr<client> process = StartProcess(options);
+  {
+    std::lock_guard<std::mutex> lock(process->lock);
+    if (process->state == kStateFailed) return false;
+    process->endInputAtWait = false;
+  }
+  SendProcessMessage(process->id, kMessageInput, 1, input.data(), input.size());
+  // The host ends the program's input at a message shorter than the
+  // maximum; input filling whole messages needs one more, empty.
+  if (!input.empty() && input.size() % kMessageMaxPayloadBytes == 0) {
+    SendProcessMessage(process->id, kMessageInput, 1, nullptr, 0);
+  }
+  std::string line;
+  while (ReadOutputLine(*process, line, 1)) errorLines.push_back(line);
+  WaitForExit(*process);
+  std::lock_guard<std::mutex> lock(process->lock);
+  if (output != nullptr) output->swap(process->standardOutput);
+  if (process->state != kStateExited) return false;
+  exitCode = process->value;
+  return true;
+}
+
+void SetLastProcessId(uint32_t id) {
+  ProcessRegistry& registry = ProcessRegistry::Instance();
+  std::lock_guard<std::mutex> lock(registry.lock);
+  registry.lastId = id;
 }
 
 }  // namespace ipc

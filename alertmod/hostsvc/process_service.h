@@ -2,9 +2,11 @@
 //
 // The module does not create processes itself: it asks the host to start a
 // program, feeds its standard input and receives its output and exit status
-// as small binary messages. Load registers the service, IOCTL code 4 delivers
-// the host's messages (on host threads), and Close shuts it down, releasing
-// every waiter. Programs are started and waited for on the caller's thread.
+// as small binary messages (a 16-byte little-endian header of length, id,
+// type and value, then the payload; at most 65536 bytes). Load registers the
+// service, IOCTL code 4 delivers the host's messages (on host threads), and
+// Close shuts it down, releasing every waiter. Programs are started and
+// waited for on the caller's thread; every function here is thread-safe.
 //
 // Lock order: the registry lock, then a client's lock.
 #ifndef ALERTMOD_HOSTSVC_PROCESS_SERVICE_H_
@@ -30,14 +32,37 @@ constexpr int32_t kStateRunning = 1;
 constexpr int32_t kStateExited = 2;
 constexpr int32_t kStateFailed = -1;
 
+// Message layout and types.
+constexpr size_t kMessageHeaderBytes = 16;
+constexpr size_t kMessageMaxBytes = 65536;
+constexpr size_t kMessageMaxPayloadBytes = kMessageMaxBytes - kMessageHeaderBytes;
+constexpr uint32_t kMessageInput = 0;        // module to host: standard input
+constexpr uint32_t kMessageOutput = 1;       // host to module: standard output
+constexpr uint32_t kMessageErrorOutput = 2;  // host to module: standard error
+constexpr uint32_t kMessageRunning = 3;
+constexpr uint32_t kMessageFailed = 4;
+constexpr uint32_t kMessageExited = 5;
+constexpr uint32_t kMessageStart = 6;
+
+// Start flags.
+constexpr uint32_t kFlagsDefault = 2;
+constexpr uint32_t kFlagKeepInputAtWait = 4;  // no empty input at wait for ".ps1"
+constexpr uint32_t kFlagFirstText = 8;
+constexpr uint32_t kFlagSecondText = 16;
+
+// Ids are the module id shifted left by 4 bits, OR a 20-bit counter.
+constexpr uint32_t kIdCounterMask = 0xFFFFF;
+
 struct ProcessOptions {
   std::vector<std::string> arguments;  // program first
-  uint32_t flags = 2;
-  std::string firstText;
-  std::string secondText;
+  uint32_t flags = kFlagsDefault;
+  std::string firstText;   // sent before the program when flag 8 is set
+  std::string secondText;  // sent before the program when flag 16 is set
 };
 
-// One program run, shared between its caller and the registry.
+// One program run, shared between its caller and the registry. The fields
+// below `condition` are guarded by `lock`; state, id and value are written
+// under it too and read by the caller under it.
 class client {
  public:
   int32_t state = kStateStarting;
@@ -45,40 +70,62 @@ class client {
   int32_t value = 0;
   std::mutex lock;
   std::condition_variable condition;  // broadcast after every message
-  std::string standardOutput;
-  std::string standardError;
+  std::string standardOutput;         // unread output of type 1, without CR
+  std::string standardError;          // unread output of type 2, without CR
   bool endInputAtWait = false;
 };
 
-// Stores the module id and the send function. Called by Load; a new Load
-// opens the service again after an earlier Close.
+// Stores the module id and the send function and opens the service. Called by
+// Load; a new Load opens the service again after an earlier Close, since the
+// library may stay loaded in between.
 void RegisterProcessService(uint32_t moduleId, SendFunction send);
 
-// Releases every waiter; later starts fail at once when `closed`.
+// Ends every run the module still waits for: a running or starting client
+// becomes failed (its result is unknown, and must not read as exit code 0)
+// and is woken; the registry forgets all ids. Later starts fail at once when
+// `closed`. Called by Close after the manager was told to stop.
 void ShutdownProcessService(bool closed);
 
-// Applies one message of the host. Returns 1 when it was applied, else 0.
+// Applies one message of the host. Returns 1 when it was applied; 0 for a
+// message shorter than its header, of an unknown type or for an id that is not
+// running. The payload is `length` - 16 bytes; carriage returns are removed.
 int OnProcessMessage(const void* data, uint64_t length);
 
-// Sends one logical message, cutting type 0 input into pieces that fit.
+// Sends one logical message. Type 0 input is cut into messages of at most
+// 65536 bytes (an empty one still sends a header); other types must fit in
+// one. False when no send function is registered, a message of another type
+// is too long, or the host refused a message (the rest is then not sent).
 bool SendProcessMessage(uint32_t id, uint32_t type, uint32_t value, const void* data,
                         size_t length);
 
 // Starts a program and waits until the host says it runs or failed. The
-// returned client's state is never kStateStarting.
+// returned client's state is never kStateStarting: kStateFailed when the
+// arguments are empty, the service is closed, no id is free, the host refused
+// the start or answered type 4, or the service was shut down meanwhile.
 std::shared_ptr<client> StartProcess(const ProcessOptions& options);
 
 // Takes the next line of standard output (channel 0) or standard error (1),
-// waiting for it. False when the program has ended and nothing is left.
+// waiting for it; once the program has ended, the unterminated rest is the
+// last line. False when the program has ended and nothing is left, and for
+// any other channel.
 bool ReadOutputLine(client& process, std::string& line, int channel);
 
-// Waits until the program is no longer running.
+// Ends the input of a ".ps1" program first, then waits until the program is no
+// longer running.
 void WaitForExit(client& process);
 
-// Runs a program with `input` on its standard input and collects its error
-// output. False when it could not be started.
+// Runs a program with `input` on its standard input (always ended, also when
+// its length is a multiple of the message payload) and collects its error
+// output as lines and, when `output` is given, its standard output. True with
+// the exit code when the program ran to its end; false when it could not be
+// started or its run was cut off by Close.
 bool RunProcess(const std::vector<std::string>& arguments, const std::string& input,
-                int32_t& exitCode, std::vector<std::string>& errorLines);
+                int32_t& exitCode, std::vector<std::string>& errorLines,
+                std::string* output = nullptr);
+
+// Test seam: the last id issued, so that a test can reach the counter's
+// wrap-around without a million starts.
+void SetLastProcessId(uint32_t id);
 
 }  // namespace ipc
 }  // namespace hx
