@@ -1,0 +1,92 @@
+// The file operations of the notification job: one output file written at a
+// time (message files), plus the directory, removal and free-space calls that
+// the job and the retry queue make on the data directory.
+//
+// The worker creates one stream per job or retry pass and is its only user;
+// a stream is never shared between threads. Tests substitute the interface, or
+// only the free-space query (platform::SetFreeBytesQuery).
+#ifndef ALERTMOD_MAIL_NOTIFY_FILE_STREAM_H_
+#define ALERTMOD_MAIL_NOTIFY_FILE_STREAM_H_
+
+#include <cstdint>
+#include <fstream>
+#include <ios>
+#include <streambuf>
+#include <string>
+
+#include "alertmod/host_records.h"
+
+namespace hx {
+
+// Free space reported when the volume cannot be queried: one byte above the
+// retry queue's floor, so that nothing is purged on a guess.
+constexpr uint64_t kUnknownFreeBytes = 104857601;
+
+class INotifyFileStream {
+ public:
+  virtual ~INotifyFileStream() = default;
+  // Closes any open file and opens `path` for writing with `mode` plus
+  // output; the file is created or truncated. Clears an earlier error state.
+  // Returns true when the stream is good afterwards.
+  virtual bool Open(const std::string& path, std::ios_base::openmode mode) = 0;
+  // Closes the file, writing out what is buffered. A failed close (or closing
+  // a stream with no open file) sets the fail state.
+  virtual void Close() = 0;
+  // No error flag is set.
+  virtual bool IsGood() const = 0;
+  // The fail or bad flag is set.
+  virtual bool Failed() const = 0;
+  // The write operations do nothing once the stream is in an error state and
+  // return the stream itself so that calls chain.
+  // Copies what `buffer` has to give, to its end.
+  virtual INotifyFileStream& WriteStream(std::streambuf* buffer) = 0;
+  // `value` in decimal.
+  virtual INotifyFileStream& WriteUInt(uint32_t value) = 0;
+  // A NUL-terminated text; a null pointer writes nothing.
+  virtual INotifyFileStream& WriteText(const char* text) = 0;
+  // Every byte of `text`, NUL bytes included.
+  virtual INotifyFileStream& WriteString(const std::string& text) = 0;
+  // Bytes written to the open file so far; 0 when there is no open file or
+  // the stream has failed.
+  virtual uint64_t Position() = 0;
+  // Bytes available to the caller on the volume of `directory`. When the query
+  // fails (logged), or the volume reports no size, returns kUnknownFreeBytes.
+  virtual uint64_t FreeBytes(const std::string& directory) = 0;
+  // True when `directory` was created or already exists; false on a
+  // file-system error.
+  virtual bool CreateDirectory(const std::string& directory) = 0;
+  // Removes the file `path`; false on a file-system error, a missing file
+  // included.
+  virtual bool RemoveFile(const std::string& path) = 0;
+};
+
+// The stream the worker uses, writing through std::ofstream. Log lines (a
+// failed free-space query) go to the host through `callback`.
+class NotifyFileStreamImpl final : public INotifyFileStream {
+ public:
+  explicit NotifyFileStreamImpl(core::HostCallbackFn callback);
+  ~NotifyFileStreamImpl() override;
+  NotifyFileStreamImpl(const NotifyFileStreamImpl&) = delete;
+  NotifyFileStreamImpl& operator=(const NotifyFileStreamImpl&) = delete;
+
+  bool Open(const std::string& path, std::ios_base::openmode mode) override;
+  void Close() override;
+  bool IsGood() const override;
+  bool Failed() const override;
+  INotifyFileStream& WriteStream(std::streambuf* buffer) override;
+  INotifyFileStream& WriteUInt(uint32_t value) override;
+  INotifyFileStream& WriteText(const char* text) override;
+  INotifyFileStream& WriteString(const std::string& text) override;
+  uint64_t Position() override;
+  uint64_t FreeBytes(const std::string& directory) override;
+  bool CreateDirectory(const std::string& directory) override;
+  bool RemoveFile(const std::string& path) override;
+
+ private:
+  core::HostCallbackFn m_callback;
+  std::ofstream m_stream;
+};
+
+}  // namespace hx
+
+#endif  // ALERTMOD_MAIL_NOTIFY_FILE_STREAM_H_
