@@ -15,6 +15,9 @@ using SetTickSourceFn = void (*)(uint32_t (*source)(void* context), void* contex
 using SetWallSourceFn = void (*)(int64_t (*source)(void* context), void* context);
 // "SetWatchdogPeriodMs": the watchdog period of managers created afterwards.
 using SetWatchdogPeriodMsFn = void (*)(uint32_t periodMs);
+// "SetWebRequestTimeoutMs": the bound on one web server exchange of web
+// links made afterwards.
+using SetWebRequestTimeoutMsFn = void (*)(uint32_t timeoutMs);
 
 }  // namespace testhooks
 
