@@ -13,7 +13,11 @@ using TestHookLookup = void* (*)(const char* name);
 
 ReferenceHost::ReferenceHost(HostOptions options)
     : m_options(std::move(options)),
-      m_log(m_options.logThreshold, m_options.logFile, m_options.echoLog) {
+      m_log(m_options.logThreshold, m_options.logFile, m_options.echoLog),
+      m_passwords(m_options.hostKeyFile),
+      m_processes(m_options.transferTool, [this](const void* data, uint32_t length) {
+        Ioctl(hx::core::kIoctlProcessMessage, data, length);
+      }) {
   InstallDefaultHandlers();
 }
 
@@ -26,6 +30,12 @@ void ReferenceHost::InstallDefaultHandlers() {
   m_handlers[hx::core::kClassProfileStatus] = accept;
   m_handlers[hx::core::kClassDocument] = accept;
   m_handlers[hx::core::kClassFrameRelease] = accept;
+  m_handlers[hx::core::kClassProcess] = [this](hx::core::HostRequest& request) {
+    return m_processes.Handle(request);
+  };
+  m_handlers[hx::core::kClassCrypto] = [this](hx::core::HostRequest& request) {
+    return m_passwords.Handle(request);
+  };
 }
 
 bool ReferenceHost::OpenLibrary(std::string* error) {
@@ -93,6 +103,8 @@ void ReferenceHost::Stop() {
   CloseModule();
   JoinThreads();
   m_dispatcher->Stop();
+  // Programs still running are ended before the module goes away.
+  m_processes.Stop();
   m_module->unload();
   m_loaded = false;
   m_module.reset();

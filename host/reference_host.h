@@ -23,6 +23,8 @@
 #include "host/dispatcher.h"
 #include "host/log_sink.h"
 #include "host/module_library.h"
+#include "host/password_service.h"
+#include "host/process_service.h"
 #include "host/request_log.h"
 
 namespace refhost {
@@ -33,6 +35,8 @@ struct HostOptions {
   std::string logFile;          // empty: standard error
   bool echoLog = true;          // write log lines as they come
   bool recordRequests = true;   // keep every request in Requests()
+  std::string transferTool = "curl";        // what "./curl" runs: a path or a name on PATH
+  std::string hostKeyFile = "hostkey.bin";  // password key, relative to the working directory
 };
 
 class ReferenceHost {
@@ -109,6 +113,9 @@ class ReferenceHost {
   std::atomic<int32_t> m_tickResult{0};
   mutable std::mutex m_handlersMutex;
   std::map<uint32_t, Handler> m_handlers;
+  PasswordService m_passwords;
+  // Last, so that its run threads end before anything they call goes.
+  ProcessService m_processes;
 };
 
 }  // namespace refhost
