@@ -20,6 +20,11 @@ struct SmtpServer {
   int32_t useSsl = 0;  // 0 plain, 1 SMTPS, 2 STARTTLS required
   std::string username;
   std::string password;  // in clear
+  // The stored, protected form of a password that could not be decrypted
+  // (another host's key, damaged text). The server is used without a
+  // password meanwhile, and the text is written back unchanged so that
+  // nothing is lost. Empty normally.
+  std::string unreadablePassword;
 };
 
 struct NotifyProfile {
