@@ -1,0 +1,21 @@
+#include "alertmod/mail/notify_helper.h"
+
+#include <tinyxml.h>
+
+#include "alertmod/hostsvc/process_service.h"
+
+namespace hx {
+
+NotifyHelper::NotifyHelper(core::HostCallbackFn callback)
+    : m_callback(callback), m_statusDocument(std::make_unique<TiXmlDocument>()) {}
+
+NotifyHelper::~NotifyHelper() = default;
+
+void NotifyHelper::ReportStatus(int32_t, int32_t) {}
+
+bool NotifyHelper::RunProcess(const std::vector<std::string>& arguments, const std::string& input,
+                              int32_t& exitCode, std::vector<std::string>& errorLines) {
+  return ipc::RunProcess(arguments, input, exitCode, errorLines);
+}
+
+}  // namespace hx

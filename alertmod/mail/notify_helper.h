@@ -1,0 +1,51 @@
+// NotifyHelper carries what the notification job keeps between work items:
+// the profile status document it reports with, and the retry queue. Its two
+// virtual operations are the job's seams to the host: status reports and
+// program runs (the transfer tool).
+//
+// The worker creates one when it starts, after clearing the data directory,
+// and is its only user.
+#ifndef ALERTMOD_MAIL_NOTIFY_HELPER_H_
+#define ALERTMOD_MAIL_NOTIFY_HELPER_H_
+
+#include <cstdint>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "alertmod/host_records.h"
+#include "alertmod/mail/retry_queue.h"
+
+class TiXmlDocument;
+
+namespace hx {
+
+class NotifyHelper {
+ public:
+  explicit NotifyHelper(core::HostCallbackFn callback);
+  virtual ~NotifyHelper();
+
+  NotifyHelper(const NotifyHelper&) = delete;
+  NotifyHelper& operator=(const NotifyHelper&) = delete;
+
+  // Tells the host the delivery status of a profile: 0 all sent, 1 otherwise.
+  virtual void ReportStatus(int32_t profileId, int32_t status);
+
+  // Runs `arguments` through the host's process service with `input` on its
+  // standard input; collects the exit code and the error output's lines.
+  // False when the program could not be started.
+  virtual bool RunProcess(const std::vector<std::string>& arguments, const std::string& input,
+                          int32_t& exitCode, std::vector<std::string>& errorLines);
+
+  core::HostCallbackFn Callback() const { return m_callback; }
+  RetryQueue& Retries() { return m_retries; }
+
+ private:
+  core::HostCallbackFn m_callback;
+  std::unique_ptr<TiXmlDocument> m_statusDocument;
+  RetryQueue m_retries;
+};
+
+}  // namespace hx
+
+#endif  // ALERTMOD_MAIL_NOTIFY_HELPER_H_
