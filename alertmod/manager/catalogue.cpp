@@ -2,6 +2,7 @@
 
 #include <tinyxml.h>
 
+#include <algorithm>
 #include <cstring>
 #include <tuple>
 
@@ -281,12 +282,21 @@ void HostSystemCatalogue::AddDeviceInputNames(const TiXmlElement& device, int32_
 
 void HostSystemCatalogue::DropUnnamedCameraStreams() {
   for (auto list = m_cameraStreams.begin(); list != m_cameraStreams.end();) {
+    // A stream stays listed while it is still a named extra stream of this
+    // camera; a later channel that reused its identifier takes it away.
+    const auto stale = [&](int32_t streamId) {
+      const auto stream = m_streams.find(streamId);
+      if (stream == m_streams.end()) {
+        return true;
+      }
+      const SourceIdentity& identity = stream->second;
+      return identity.kind != kKindVideoInput || identity.context < 1 ||
+             static_cast<int32_t>(CameraKey(identity.plugin, identity.device, identity.input)) !=
+                 list->first ||
+             m_names.count(identity) == 0;
+    };
     std::vector<int32_t>& streams = list->second;
-    for (auto it = streams.begin(); it != streams.end();) {
-      const auto stream = m_streams.find(*it);
-      const bool named = stream != m_streams.end() && m_names.count(stream->second) != 0;
-      it = named ? std::next(it) : streams.erase(it);
-    }
+    streams.erase(std::remove_if(streams.begin(), streams.end(), stale), streams.end());
     list = streams.empty() ? m_cameraStreams.erase(list) : std::next(list);
   }
 }

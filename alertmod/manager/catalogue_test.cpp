@@ -264,6 +264,24 @@ TEST(CatalogueRebuildTest, DropsUnnamedStreamsFromCameraLists) {
   EXPECT_EQ(catalogue.StreamIdentity(13), std::nullopt);
 }
 
+TEST(CatalogueRebuildTest, ReusedStreamIdentifierLeavesCameraList) {
+  // A later plug-in reuses stream 77 for its own camera; the first camera
+  // must not pick up the other camera's stream as one of its own.
+  HostSystemCatalogue catalogue;
+  Rebuild(catalogue, R"(<Trellan Delta="0">
+      <Devices ID="65536"><Device Number="1"><Context Number="1">
+        <Video><Input Number="0" Name="Gate still"/></Video>
+        <Codec><Encoder><Channel ID="77" Number="0" Width="640" Height="480" Standard="0"/></Encoder></Codec>
+      </Context></Device></Devices>
+      <Devices ID="196608"><Device Number="2"><Context Number="1">
+        <Video><Input Number="1" Name="Dock still"/></Video>
+        <Codec><Encoder><Channel ID="77" Number="1" Width="320" Height="240" Standard="0"/></Encoder></Codec>
+      </Context></Device></Devices></Trellan>)");
+  EXPECT_TRUE(catalogue.CameraStreams(CameraKey(kEncoders, 1, 0)).empty());
+  EXPECT_EQ(catalogue.CameraStreams(CameraKey(0x30000, 2, 1)), std::vector<int32_t>{77});
+  EXPECT_EQ(catalogue.StreamSourceKey(77), EventSourceKey(0x30000, 2, 1, 1));
+}
+
 TEST(CatalogueRebuildTest, MapsSequencedChannelsToInputs) {
   HostSystemCatalogue catalogue;
   Rebuild(catalogue, R"(<Trellan Delta="0"><Devices ID="65536"><Device Number="1">
