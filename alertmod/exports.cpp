@@ -7,6 +7,7 @@
 #include "alertmod/diag/log.h"
 #include "alertmod/host_records.h"
 #include "alertmod/hostsvc/process_service.h"
+#include "alertmod/manager/current_manager.h"
 #include "alertmod/manager/notify_manager.h"
 #include "alertmod/manager/worker_job.h"
 
@@ -77,6 +78,7 @@ int32_t Load(hx::core::LoadParmsIn* in, hx::core::LoadParmsOut* out) {
     g_hostCallback.store(callback);
     if (g_manager.load() == nullptr) {
       g_manager.store(new hx::NotifyManager(callback, hx::DefaultWorkerJobFactory(callback)));
+      hx::SetCurrentManager(g_manager.load());
     }
     if (out != nullptr) FillLoadParmsOut(out);
     hx::ipc::RegisterProcessService(kModuleId, &SendProcessMessageToHost);
@@ -84,7 +86,10 @@ int32_t Load(hx::core::LoadParmsIn* in, hx::core::LoadParmsOut* out) {
 }
 
 int32_t Unload() {
-  return Guarded("Unload", [] { delete g_manager.exchange(nullptr); });
+  return Guarded("Unload", [] {
+    hx::SetCurrentManager(nullptr);
+    delete g_manager.exchange(nullptr);
+  });
 }
 
 int32_t Open() {

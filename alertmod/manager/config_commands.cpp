@@ -1,7 +1,178 @@
+// Configuration commands: loading "notify.xml" at Open, saving and posting
+// the configuration after every change, configuration updates from the host
+// and its second reviewer setting. All run on the host threads of Open and
+// IOCTL code 2, one at a time.
+#include <cerrno>
+#include <vector>
+
+#include <tinyxml.h>
+
+#include "alertmod/config/durable_xml.h"
+#include "alertmod/config/module_replies.h"
+#include "alertmod/config/xml_attr.h"
+#include "alertmod/diag/log.h"
+#include "alertmod/mail/smtp_probe.h"
+#include "alertmod/mail/templates.h"
 #include "alertmod/manager/notify_manager.h"
+#include "alertmod/platform/error_text.h"
+#include "alertmod/platform/files.h"
 
 namespace hx {
+namespace {
 
-void NotifyManager::Open() {}
+constexpr char kConfigFileName[] = "notify.xml";
+// Where a "notify.xml" that could not be used is kept before the defaults
+// are written over it.
+constexpr char kRejectedConfigFileName[] = "notify.xml.rejected";
+
+bool SameServer(const SmtpServer& a, const SmtpServer& b) {
+  return a.description == b.description && a.address == b.address && a.port == b.port &&
+         a.useSsl == b.useSsl && a.username == b.username && a.password == b.password &&
+         a.unreadablePassword == b.unreadablePassword;
+}
+
+// The lists count as unchanged as soon as one old server has an equal
+// counterpart, the first new server with its description.
+bool ServersChanged(const std::vector<SmtpServer>& before, const std::vector<SmtpServer>& after) {
+  if (before.size() > after.size() || before.empty()) return true;
+  for (const SmtpServer& old : before) {
+    for (const SmtpServer& server : after) {
+      if (server.description != old.description) continue;
+      if (SameServer(old, server)) return false;
+      break;
+    }
+  }
+  return true;
+}
+
+// Profiles whose last delivery result no longer applies after an update, in
+// ascending identifier order.
+std::vector<int32_t> ProfilesToReset(const NotifyCfg& before, const NotifyCfg& after) {
+  bool serversChanged = ServersChanged(before.Servers(), after.Servers());
+  std::vector<int32_t> ids;
+  for (const auto& entry : after.Profiles()) {
+    const NotifyProfile* old = before.FindProfile(entry.first);
+    if (serversChanged || old == nullptr || old->from != entry.second.from) {
+      ids.push_back(entry.first);
+    }
+  }
+  return ids;
+}
+
+void KeepRejectedFile(core::HostCallbackFn callback) {
+  int error = platform::RenameReplacing(kConfigFileName, kRejectedConfigFileName);
+  if (error == ENOENT) return;
+  if (error == 0) {
+    LogToHost(core::kModuleId, callback, LogLevelWarning,
+              "The unusable %s was kept as %s before a new one is written.", kConfigFileName,
+              kRejectedConfigFileName);
+    return;
+  }
+  LogToHost(core::kModuleId, callback, LogLevelError, "Unable to keep the unusable %s as %s: %s",
+            kConfigFileName, kRejectedConfigFileName, platform::ErrorText(error).c_str());
+}
+
+const TiXmlElement* SecondReviewerElement(const TiXmlDocument& document) {
+  const TiXmlElement* root = document.FirstChildElement("Trellan");
+  const TiXmlElement* users = root != nullptr ? root->FirstChildElement("Users") : nullptr;
+  return users != nullptr ? users->FirstChildElement("SecondReviewer") : nullptr;
+}
+
+}  // namespace
+
+ConfigServices NotifyManager::MakeConfigServices(core::HostCallbackFn callback) {
+  ConfigServices services;
+  services.callback = callback;
+  services.errorSink = [callback](const std::string& text) {
+    LogToHost(core::kModuleId, callback, LogLevelError, "%s", text.c_str());
+  };
+  services.hasPlaceholders = &HasPlaceholders;
+  return services;
+}
+
+void NotifyManager::Open() {
+  LoadConfig();
+  PostConfig();
+}
+
+void NotifyManager::LoadConfig() {
+  ProbeSmtps(m_config);
+  PostModuleDescription(m_callback);
+  TiXmlDocument document;
+  // Parsed into a copy: a file that is rejected halfway leaves the defaults.
+  NotifyCfg loaded = m_config;
+  if (LoadXmlDurably(document, kConfigFileName) && loaded.Parse(document, m_configServices)) {
+    m_config = std::move(loaded);
+    LogToHost(core::kModuleId, m_callback, LogLevelInfo,
+              "Loaded configuration from disk successfully");
+    SetVideoBufferLimit(m_config.EmailSizeLimitBytes());
+    PublishConfigSettings();
+    return;
+  }
+  LogToHost(core::kModuleId, m_callback, LogLevelWarning,
+            "Either no configuration or an improper configuration was found, continuing with "
+            "empty configuration.");
+  // PostConfig is about to write the defaults; a file the user may still
+  // want must not be lost under them.
+  KeepRejectedFile(m_callback);
+}
+
+void NotifyManager::PostConfig() {
+  TiXmlDocument document;
+  BuildConfigDocument(document, m_config, m_configServices);
+  std::string error;
+  if (!SaveXmlDurably(document, kConfigFileName, &error)) {
+    LogToHost(core::kModuleId, m_callback, LogLevelError,
+              "Unable to save the configuration to %s: %s", kConfigFileName, error.c_str());
+  }
+  RevealPasswords(document, m_configServices);
+  PostToHost(m_callback, core::kClassDocument, PrintCompact(document));
+}
+
+bool NotifyManager::ApplyConfigurationUpdate(const TiXmlDocument& document) {
+  // Parsed into a copy, so that a rejected update changes nothing at all.
+  NotifyCfg updated = m_config;
+  if (!updated.Parse(document, m_configServices)) return false;
+  NotifyCfg previous = std::move(m_config);
+  m_config = std::move(updated);
+  LogToHost(core::kModuleId, m_callback, LogLevelInfo, "Updated configuration successfully");
+  PostConfig();
+  PublishConfigSettings();
+  ProfileStatusDocument status;
+  for (int32_t id : ProfilesToReset(previous, m_config)) {
+    ReportProfileStatus(status, id, kProfileStatusUnknown, m_callback);
+  }
+  if (previous.EmailSizeLimitMB() != m_config.EmailSizeLimitMB()) {
+    SetVideoBufferLimit(m_config.EmailSizeLimitBytes());
+  }
+  return true;
+}
+
+bool NotifyManager::ApplySecondReviewer(const TiXmlDocument& document) {
+  const TiXmlElement* reviewer = SecondReviewerElement(document);
+  if (reviewer == nullptr) return false;
+  std::optional<int32_t> enabled = IntAttribute(*reviewer, "Enabled");
+  if (!enabled || !m_config.SetAttachmentsDisabled(*enabled != 0)) return false;
+  // Turning the mode off does not bring the attach flags back.
+  if (m_config.AttachmentsDisabled() && m_config.DisableAllAttachments()) {
+    LogToHost(core::kModuleId, m_callback, LogLevelInfo,
+              "Disabled all attachments for second reviewer mode.");
+  }
+  PostConfig();
+  return true;
+}
+
+void NotifyManager::PublishConfigSettings() {
+  WorkerSettings settings;
+  settings.maxRetrySeconds = m_config.MaxRetrySeconds();
+  settings.maxRetryQueue = m_config.MaxRetryQueue();
+  PublishWorkerSettings(settings);
+}
+
+void NotifyManager::SetVideoBufferLimit(int64_t bytes) {
+  // The one place where the video buffer learns the configured limit
+  // (VideoBuffer::SetMaxBytes); the buffer is not part of the manager yet.
+  (void)bytes;
+}
 
 }  // namespace hx

@@ -23,7 +23,8 @@ void SNOTIFY_CALLBACK::OnReady() { m_manager->MoveToReady(this); }
 NotifyManager::NotifyManager(core::HostCallbackFn callback, WorkerJobFactory jobFactory)
     : m_callback(callback),
       m_jobFactory(std::move(jobFactory)),
-      m_watchdogPeriod(g_watchdogPeriodMs.load()) {
+      m_watchdogPeriod(g_watchdogPeriodMs.load()),
+      m_configServices(MakeConfigServices(callback)) {
   GetLgr()->SetFileName("notifylog.txt");
 }
 

@@ -20,10 +20,13 @@
 #include <mutex>
 #include <vector>
 
+#include "alertmod/config/notify_cfg.h"
 #include "alertmod/host_records.h"
 #include "alertmod/mail/notify_work_item.h"
 #include "alertmod/manager/worker_job.h"
 #include "alertmod/video/notify_ready.h"
+
+class TiXmlDocument;
 
 namespace hx {
 
@@ -86,6 +89,24 @@ class NotifyManager {
   void OnAlarmDocument(const void* data, uint32_t length);
   void OnHostDocument(const void* data, uint32_t length);
 
+  // Configuration commands, on the host threads of Open and IOCTL code 2.
+  //
+  // Saves the configuration to "notify.xml" (passwords protected) and posts
+  // it to the host (passwords in clear). A failed save is logged; the
+  // configuration is still posted.
+  void PostConfig();
+  // Applies the "Notify" element of a host document. False, with nothing
+  // changed, when the configuration parser rejects it; otherwise the new
+  // configuration is saved and posted, and the profiles whose last delivery
+  // result no longer applies are reported with status -1.
+  bool ApplyConfigurationUpdate(const TiXmlDocument& document);
+  // Applies the host's second reviewer setting (Trellan / Users /
+  // SecondReviewer "Enabled"). Returns whether the mode changed; a change
+  // is saved and posted, and turning the mode on clears every attach flag.
+  bool ApplySecondReviewer(const TiXmlDocument& document);
+  // The live configuration. Host threads only.
+  const NotifyCfg& Config() const { return m_config; }
+
   // Hands new retry settings to the worker, which applies them before its next
   // item. Any thread.
   void PublishWorkerSettings(const WorkerSettings& settings);
@@ -109,10 +130,17 @@ class NotifyManager {
   void RunItem(IWorkerJob& job, NotifyWorkItem& item);
   void MarkStopped();
   void SendTick();
+  void LoadConfig();
+  void PublishConfigSettings();
+  void SetVideoBufferLimit(int64_t bytes);
+  static ConfigServices MakeConfigServices(core::HostCallbackFn callback);
 
   const core::HostCallbackFn m_callback;
   const WorkerJobFactory m_jobFactory;
   const std::chrono::milliseconds m_watchdogPeriod;
+  const ConfigServices m_configServices;
+
+  NotifyCfg m_config;  // host threads only
 
   mutable std::mutex m_queueMutex;
   std::condition_variable m_queueSignal;

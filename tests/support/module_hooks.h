@@ -19,6 +19,15 @@ using SetWatchdogPeriodMsFn = void (*)(uint32_t periodMs);
 // links made afterwards.
 using SetWebRequestTimeoutMsFn = void (*)(uint32_t timeoutMs);
 
+// "ApplyConfigurationUpdate": parses `text` as a host document and applies it
+// to the live manager as a configuration update. 1 accepted, 0 rejected by
+// the configuration parser, -1 not applied (no manager, or not XML). Call it
+// on the host's dispatcher thread, as IOCTL code 2 would be.
+using ApplyConfigurationUpdateFn = int32_t (*)(const char* text, uint32_t length);
+// "ApplySecondReviewer": the same for the second reviewer setting of a full
+// document. 1 when the mode changed, 0 when not, -1 not applied.
+using ApplySecondReviewerFn = int32_t (*)(const char* text, uint32_t length);
+
 }  // namespace testhooks
 
 #endif  // ALERTMOD_TESTS_SUPPORT_MODULE_HOOKS_H_
