@@ -7,6 +7,8 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <fstream>
+#include <sstream>
 #include <string>
 #include <thread>
 
@@ -18,6 +20,8 @@ struct CommandLine {
   refhost::HostOptions host;
   int seconds = 5;
   bool help = false;
+  bool showConfig = false;
+  std::string updateFile;
   std::string error;
 };
 
@@ -31,6 +35,10 @@ const char kUsage[] =
     "  --seconds N        how long to run (default 5)\n"
     "  --log-level N      host log threshold: 25 info, 50 warning, 75 error (default 25)\n"
     "  --log-file PATH    write the host log to PATH instead of standard error\n"
+    "  --update FILE      after Open, send FILE as a configuration update (a Notify\n"
+    "                     element, or a whole Trellan document)\n"
+    "  --show-config      print the configuration the module posted last, passwords\n"
+    "                     shown as ***\n"
     "  --help             show this text\n";
 
 std::string DefaultModulePath() {
@@ -62,6 +70,10 @@ CommandLine Parse(int argc, char** argv) {
       cl.host.modulePath = argv[++i];
     } else if (arg == "--log-file" && value) {
       cl.host.logFile = argv[++i];
+    } else if (arg == "--update" && value) {
+      cl.updateFile = argv[++i];
+    } else if (arg == "--show-config") {
+      cl.showConfig = true;
     } else if (arg == "--seconds" && value && ParseInt(value, &number) && number >= 0) {
       cl.seconds = number;
       ++i;
@@ -84,6 +96,25 @@ void PrintModuleLog(const refhost::ReferenceHost& host, refhost::LogSink& log) {
   }
 }
 
+bool ReadWholeFile(const std::string& path, std::string* text) {
+  std::ifstream in(path, std::ios::binary);
+  if (!in) return false;
+  std::ostringstream content;
+  content << in.rdbuf();
+  *text = content.str();
+  return true;
+}
+
+void PrintConfiguration(refhost::ConfigStore& store) {
+  std::string configuration = store.Configuration();
+  if (configuration.empty()) {
+    printf("The module posted no configuration.\n");
+    return;
+  }
+  printf("Configuration posted by the module:\n%s",
+         refhost::MaskedConfiguration(configuration).c_str());
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -96,6 +127,11 @@ int main(int argc, char** argv) {
     fprintf(stderr, "alertmod-host: %s\n\n%s", cl.error.c_str(), kUsage);
     return 2;
   }
+  std::string update;
+  if (!cl.updateFile.empty() && !ReadWholeFile(cl.updateFile, &update)) {
+    fprintf(stderr, "alertmod-host: cannot read %s\n", cl.updateFile.c_str());
+    return 2;
+  }
   refhost::ReferenceHost host(cl.host);
   std::string error;
   if (!host.Start(&error)) {
@@ -104,9 +140,11 @@ int main(int argc, char** argv) {
     return 1;
   }
   printf("Module loaded from %s; running for %d s.\n", cl.host.modulePath.c_str(), cl.seconds);
+  if (!cl.updateFile.empty()) host.SendConfigurationUpdate(update);
   std::this_thread::sleep_for(std::chrono::seconds(cl.seconds));
   host.Stop();
   printf("Module stopped.\n");
   PrintModuleLog(host, host.Log());
+  if (cl.showConfig) PrintConfiguration(host.Config());
   return 0;
 }

@@ -146,6 +146,10 @@ void ReferenceHost::SendHostDocument(const std::string& text) {
   Ioctl(hx::core::kIoctlHostDocument, text.data(), static_cast<uint32_t>(text.size()));
 }
 
+void ReferenceHost::SendConfigurationUpdate(const std::string& notifyOrDocument) {
+  SendHostDocument(ConfigurationUpdateDocument(notifyOrDocument));
+}
+
 void ReferenceHost::SetHandler(uint32_t requestClass, Handler handler) {
   std::lock_guard<std::mutex> lock(m_handlersMutex);
   m_handlers[requestClass] = std::move(handler);
@@ -165,6 +169,7 @@ int32_t ReferenceHost::Callback(hx::core::HostRequest* request, void*) {
 
 int32_t ReferenceHost::Handle(hx::core::HostRequest& request) {
   if (m_options.recordRequests) m_requests.Add(request);
+  m_config.Record(request);
   if (request.requestClass == hx::core::kClassLog) return AnswerLog(request);
   Handler handler;
   {

@@ -20,6 +20,7 @@
 #include <thread>
 
 #include "alertmod/host_records.h"
+#include "host/config_store.h"
 #include "host/dispatcher.h"
 #include "host/log_sink.h"
 #include "host/module_library.h"
@@ -77,6 +78,9 @@ class ReferenceHost {
   int32_t Ioctl(uint32_t code, const void* data, uint32_t length);
   // IOCTL code 2 with `text` from the dispatcher.
   void SendHostDocument(const std::string& text);
+  // Sends a configuration update (IOCTL code 2): a "Notify" element, which
+  // is wrapped in "Trellan" with Delta 1, or a whole "Trellan" document.
+  void SendConfigurationUpdate(const std::string& notifyOrDocument);
 
   // Replaces the answer to one request class. Install before the module
   // makes such requests.
@@ -89,6 +93,9 @@ class ReferenceHost {
 
   RequestLog& Requests() { return m_requests; }
   LogSink& Log() { return m_log; }
+  // The configuration, module description and status reports the module
+  // posted.
+  ConfigStore& Config() { return m_config; }
   Dispatcher& GetDispatcher() { return *m_dispatcher; }
   const hx::core::LoadParmsOut& LoadOut() const { return m_loadOut; }
   bool Loaded() const { return m_module != nullptr; }
@@ -103,6 +110,7 @@ class ReferenceHost {
   HostOptions m_options;
   LogSink m_log;
   RequestLog m_requests;
+  ConfigStore m_config;
   std::unique_ptr<ModuleLibrary> m_module;
   bool m_loaded = false;
   std::unique_ptr<Dispatcher> m_dispatcher;
