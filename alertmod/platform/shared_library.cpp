@@ -1,0 +1,24 @@
+#include "alertmod/platform/shared_library.h"
+
+#include <dlfcn.h>
+
+namespace hx {
+namespace platform {
+
+void* OpenSharedLibrary(const std::string& path) {
+  // Local binding keeps the codec libraries' symbols out of the host's
+  // namespace; binding now surfaces a broken library at load, not mid-clip.
+  return dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL);
+}
+
+void* FindSharedSymbol(void* handle, const char* name) {
+  if (handle == nullptr || name == nullptr) return nullptr;
+  return dlsym(handle, name);
+}
+
+void CloseSharedLibrary(void* handle) {
+  if (handle != nullptr) dlclose(handle);
+}
+
+}  // namespace platform
+}  // namespace hx

@@ -1,0 +1,239 @@
+#include "alertmod/video/av_libs.h"
+
+#include "alertmod/platform/shared_library.h"
+
+// Binds the member named like the symbol; keeps name and member in step.
+#define AV_BIND(symbol) Bind(#symbol, symbol)
+
+namespace hx {
+namespace {
+
+// Majors of FFmpeg 7, 6 and 5, newest first.
+const std::vector<int> kAvCodecMajors = {61, 60, 59};
+const std::vector<int> kAvFormatMajors = {61, 60, 59};
+const std::vector<int> kAvUtilMajors = {59, 58, 57};
+const std::vector<int> kAvFilterMajors = {10, 9, 8};
+const std::vector<int> kSwResampleMajors = {5, 4};
+
+std::string LibraryPath(const std::string& directory, const char* baseName, int major) {
+  std::string path = directory;
+  if (!path.empty() && path.back() != '/') path.push_back('/');
+  return path + "lib" + baseName + ".so." + std::to_string(major);
+}
+
+}  // namespace
+
+LibWrapper::~LibWrapper() {
+  platform::CloseSharedLibrary(m_module);
+}
+
+void LibWrapper::Unload() {
+  BeforeUnload();
+  platform::CloseSharedLibrary(m_module);
+  AfterUnload();
+  m_module = nullptr;
+  m_loadedFile.clear();
+  Resolve();
+}
+
+bool LibWrapper::LoadFile(const char* baseName, const std::vector<int>& majors, int builtMajor,
+                          const char* versionSymbol) {
+  for (int major : majors) {
+    const std::string path = LibraryPath(m_directory, baseName, major);
+    void* module = platform::OpenSharedLibrary(path);
+    if (module == nullptr) continue;
+    ReplaceModule(module, path);
+    Resolve();
+    if (!IsResolved()) continue;
+    if (IsBuiltMajor(versionSymbol, builtMajor)) return true;
+    // Its structures are laid out differently from what the module reads.
+    ReplaceModule(nullptr, std::string());
+    Resolve();
+  }
+  return false;
+}
+
+template <typename Fn>
+bool LibWrapper::Bind(const char* name, Fn& slot) {
+  slot = reinterpret_cast<Fn>(platform::FindSharedSymbol(m_module, name));
+  return slot != nullptr;
+}
+
+void LibWrapper::ReplaceModule(void* module, const std::string& file) {
+  platform::CloseSharedLibrary(m_module);
+  m_module = module;
+  m_loadedFile = file;
+}
+
+bool LibWrapper::IsBuiltMajor(const char* versionSymbol, int builtMajor) const {
+  using VersionFn = unsigned (*)();
+  auto version = reinterpret_cast<VersionFn>(platform::FindSharedSymbol(m_module, versionSymbol));
+  // FFmpeg packs a version as major << 16 | minor << 8 | micro.
+  return version != nullptr && static_cast<int>(version() >> 16) == builtMajor;
+}
+
+bool AVCodecLib::Load() {
+  return LoadFile("avcodec", kAvCodecMajors, LIBAVCODEC_VERSION_MAJOR, "avcodec_version");
+}
+
+void AVCodecLib::Resolve() {
+  bool ok = AV_BIND(avcodec_version);
+  ok &= AV_BIND(avcodec_find_decoder);
+  ok &= AV_BIND(avcodec_find_encoder);
+  ok &= AV_BIND(av_packet_alloc);
+  ok &= AV_BIND(av_packet_free);
+  ok &= AV_BIND(av_packet_unref);
+  ok &= AV_BIND(av_new_packet);
+  ok &= AV_BIND(av_get_bits_per_sample);
+  ok &= AV_BIND(avcodec_send_packet);
+  ok &= AV_BIND(avcodec_receive_frame);
+  ok &= AV_BIND(avcodec_send_frame);
+  ok &= AV_BIND(avcodec_receive_packet);
+  ok &= AV_BIND(avcodec_alloc_context3);
+  ok &= AV_BIND(avcodec_parameters_from_context);
+  ok &= AV_BIND(avcodec_parameters_to_context);
+  ok &= AV_BIND(avcodec_open2);
+  ok &= AV_BIND(avcodec_is_open);
+  ok &= AV_BIND(avcodec_close);
+  ok &= AV_BIND(avcodec_free_context);
+  ok &= AV_BIND(avcodec_decode_subtitle2);
+  ok &= AV_BIND(avsubtitle_free);
+  m_resolved = ok && HasModule();
+}
+
+bool AVFormatLib::Load() {
+  return LoadFile("avformat", kAvFormatMajors, LIBAVFORMAT_VERSION_MAJOR, "avformat_version");
+}
+
+void AVFormatLib::Resolve() {
+  AV_BIND(av_register_all);
+  bool ok = AV_BIND(avformat_version);
+  ok &= AV_BIND(avformat_alloc_context);
+  ok &= AV_BIND(av_guess_format);
+  ok &= AV_BIND(avio_open2);
+  ok &= AV_BIND(avformat_new_stream);
+  ok &= AV_BIND(avformat_write_header);
+  ok &= AV_BIND(avformat_query_codec);
+  ok &= AV_BIND(av_write_frame);
+  ok &= AV_BIND(av_interleaved_write_frame);
+  ok &= AV_BIND(avformat_open_input);
+  ok &= AV_BIND(avformat_close_input);
+  ok &= AV_BIND(av_read_frame);
+  ok &= AV_BIND(av_write_trailer);
+  ok &= AV_BIND(avio_close);
+  ok &= AV_BIND(avio_closep);
+  ok &= AV_BIND(avformat_free_context);
+  ok &= AV_BIND(avformat_seek_file);
+  m_resolved = ok && HasModule();
+}
+
+bool AVUtilLib::Load() {
+  return LoadFile("avutil", kAvUtilMajors, LIBAVUTIL_VERSION_MAJOR, "avutil_version");
+}
+
+void AVUtilLib::Resolve() {
+  bool ok = AV_BIND(avutil_version);
+  ok &= AV_BIND(av_dict_set_int);
+  ok &= AV_BIND(av_dict_set);
+  ok &= AV_BIND(av_dict_free);
+  ok &= AV_BIND(av_rescale_q);
+  ok &= AV_BIND(av_d2q);
+  ok &= AV_BIND(av_frame_alloc);
+  ok &= AV_BIND(av_frame_free);
+  ok &= AV_BIND(av_strdup);
+  ok &= AV_BIND(av_mallocz);
+  ok &= AV_BIND(av_get_pix_fmt_name);
+  ok &= AV_BIND(av_channel_layout_default);
+  m_resolved = ok && HasModule();
+}
+
+bool AVFilterLib::Load() {
+  return LoadFile("avfilter", kAvFilterMajors, LIBAVFILTER_VERSION_MAJOR, "avfilter_version");
+}
+
+void AVFilterLib::Resolve() {
+  AV_BIND(avfilter_register_all);
+  bool ok = AV_BIND(avfilter_version);
+  ok &= AV_BIND(avfilter_graph_free);
+  ok &= AV_BIND(av_buffersrc_add_frame_flags);
+  ok &= AV_BIND(av_buffersink_get_frame);
+  ok &= AV_BIND(avfilter_graph_alloc);
+  ok &= AV_BIND(avfilter_graph_create_filter);
+  ok &= AV_BIND(avfilter_get_by_name);
+  ok &= AV_BIND(avfilter_inout_alloc);
+  ok &= AV_BIND(avfilter_graph_parse_ptr);
+  ok &= AV_BIND(avfilter_graph_config);
+  ok &= AV_BIND(avfilter_inout_free);
+  m_resolved = ok && HasModule();
+}
+
+bool SWResampleLib::Load() {
+  return LoadFile("swresample", kSwResampleMajors, LIBSWRESAMPLE_VERSION_MAJOR,
+                  "swresample_version");
+}
+
+void SWResampleLib::Resolve() {
+  bool ok = AV_BIND(swresample_version);
+  ok &= AV_BIND(swr_alloc_set_opts2);
+  ok &= AV_BIND(swr_init);
+  ok &= AV_BIND(swr_free);
+  ok &= AV_BIND(swr_convert_frame);
+  ok &= AV_BIND(swr_get_delay);
+  m_resolved = ok && HasModule();
+}
+
+MultiLibWrapper::~MultiLibWrapper() = default;
+
+bool MultiLibWrapper::LoadEach() {
+  bool ok = !m_helpers.empty();
+  for (auto& helper : m_helpers) ok &= helper->Load();
+  return ok;
+}
+
+bool MultiLibWrapper::AllLoaded() const {
+  if (m_helpers.empty()) return false;
+  for (const auto& helper : m_helpers) {
+    if (!helper->IsLoaded()) return false;
+  }
+  return true;
+}
+
+bool MultiLibWrapper::LoadAll() {
+  if (AllLoaded()) return true;
+  if (!LoadEach()) return false;
+  AfterAllLoaded();
+  return true;
+}
+
+bool MultiLibWrapper::Reload() {
+  for (auto& helper : m_helpers) helper->Unload();
+  return LoadAll();
+}
+
+av_init::av_init(const std::string& directory) {
+  AVCodecLib::SetDirectory(directory);
+  AVFormatLib::SetDirectory(directory);
+  AVUtilLib::SetDirectory(directory);
+  AVFilterLib::SetDirectory(directory);
+  SWResampleLib::SetDirectory(directory);
+  Register(static_cast<AVCodecLib*>(this));
+  Register(static_cast<AVFormatLib*>(this));
+  Register(static_cast<AVUtilLib*>(this));
+  Register(static_cast<AVFilterLib*>(this));
+  Register(static_cast<SWResampleLib*>(this));
+  LoadAll();
+}
+
+av_init& av_init::Instance() {
+  // Made on first use rather than during static initialisation, so that a
+  // machine without the libraries costs nothing until a clip is wanted.
+  static av_init instance;
+  return instance;
+}
+
+void av_init::AfterAllLoaded() {
+  if (AVFormatLib::av_register_all != nullptr) AVFormatLib::av_register_all();
+  if (AVFilterLib::avfilter_register_all != nullptr) AVFilterLib::avfilter_register_all();
+}
+
+}  // namespace hx
