@@ -9,6 +9,9 @@ std::atomic<ReferenceHost*> g_loadedHost{nullptr};
 
 using TestHookLookup = void* (*)(const char* name);
 
+// Level of the host's own fault reports in its log.
+constexpr int32_t kHostFaultLevel = 75;
+
 }  // namespace
 
 ReferenceHost::ReferenceHost(HostOptions options)
@@ -29,7 +32,9 @@ void ReferenceHost::InstallDefaultHandlers() {
   Handler accept = [](hx::core::HostRequest&) { return 0; };
   m_handlers[hx::core::kClassProfileStatus] = accept;
   m_handlers[hx::core::kClassDocument] = accept;
-  m_handlers[hx::core::kClassFrameRelease] = accept;
+  m_handlers[hx::core::kClassFrameRelease] = [this](hx::core::HostRequest& request) {
+    return m_frames.OnReleaseRequest(request);
+  };
   m_handlers[hx::core::kClassProcess] = [this](hx::core::HostRequest& request) {
     return m_processes.Handle(request);
   };
@@ -106,10 +111,17 @@ void ReferenceHost::Stop() {
   // Programs still running are ended before the module goes away.
   m_processes.Stop();
   m_module->unload();
+  ReportFrameFaults();
   m_loaded = false;
   m_module.reset();
   m_dispatcher.reset();
   g_loadedHost.store(nullptr);
+}
+
+void ReferenceHost::ReportFrameFaults() {
+  // After Unload the module holds no frame; anything not returned is lost.
+  const std::string report = m_frames.FaultReport();
+  if (!report.empty()) m_log.Write(0, kHostFaultLevel, "host: " + report);
 }
 
 int32_t ReferenceHost::Write(const hx::core::WriteParmsIn& in, hx::core::WriteParmsOut* out) {

@@ -22,6 +22,7 @@
 #include "alertmod/host_records.h"
 #include "host/config_store.h"
 #include "host/dispatcher.h"
+#include "host/frame_pool.h"
 #include "host/log_sink.h"
 #include "host/module_library.h"
 #include "host/password_service.h"
@@ -93,6 +94,8 @@ class ReferenceHost {
 
   RequestLog& Requests() { return m_requests; }
   LogSink& Log() { return m_log; }
+  // The frame buffers lent to the module; the class 0x200 handler returns them.
+  FramePool& Frames() { return m_frames; }
   // The configuration, module description and status reports the module
   // posted.
   ConfigStore& Config() { return m_config; }
@@ -106,10 +109,12 @@ class ReferenceHost {
   int32_t AnswerLog(const hx::core::HostRequest& request);
   int32_t AnswerTick();
   void InstallDefaultHandlers();
+  void ReportFrameFaults();
 
   HostOptions m_options;
   LogSink m_log;
   RequestLog m_requests;
+  FramePool m_frames;
   ConfigStore m_config;
   std::unique_ptr<ModuleLibrary> m_module;
   bool m_loaded = false;
