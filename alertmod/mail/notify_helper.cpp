@@ -1,17 +1,16 @@
 #include "alertmod/mail/notify_helper.h"
 
-#include <tinyxml.h>
-
 #include "alertmod/hostsvc/process_service.h"
 
 namespace hx {
 
-NotifyHelper::NotifyHelper(core::HostCallbackFn callback)
-    : m_callback(callback), m_statusDocument(std::make_unique<TiXmlDocument>()) {}
+NotifyHelper::NotifyHelper(core::HostCallbackFn callback) : m_callback(callback) {}
 
 NotifyHelper::~NotifyHelper() = default;
 
-void NotifyHelper::ReportStatus(int32_t, int32_t) {}
+void NotifyHelper::ReportStatus(int32_t profileId, int32_t status) {
+  ReportProfileStatus(m_statusDocument, profileId, status, m_callback);
+}
 
 bool NotifyHelper::RunProcess(const std::vector<std::string>& arguments, const std::string& input,
                               int32_t& exitCode, std::vector<std::string>& errorLines) {

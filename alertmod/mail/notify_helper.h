@@ -9,14 +9,12 @@
 #define ALERTMOD_MAIL_NOTIFY_HELPER_H_
 
 #include <cstdint>
-#include <memory>
 #include <string>
 #include <vector>
 
+#include "alertmod/config/module_replies.h"
 #include "alertmod/host_records.h"
 #include "alertmod/mail/retry_queue.h"
-
-class TiXmlDocument;
 
 namespace hx {
 
@@ -42,7 +40,7 @@ class NotifyHelper {
 
  private:
   core::HostCallbackFn m_callback;
-  std::unique_ptr<TiXmlDocument> m_statusDocument;
+  ProfileStatusDocument m_statusDocument;
   RetryQueue m_retries;
 };
 

@@ -1,23 +1,53 @@
 #include "alertmod/manager/worker_job.h"
 
+#include "alertmod/mail/mail_file.h"
+#include "alertmod/mail/notification_job.h"
+#include "alertmod/mail/notify_file_stream.h"
+#include "alertmod/mail/notify_helper.h"
+
 namespace hx {
 namespace {
 
-// Drops every item. Stands in until the notification job is wired.
-class DroppingJob final : public IWorkerJob {
+// The notification job as the worker runs it: one NotifyHelper for the whole
+// run, and a fresh file stream for every item and retry pass.
+class NotificationWorkerJob final : public IWorkerJob {
  public:
-  void Start(const WorkerSettings&) override {}
-  bool HasPendingRetries() const override { return false; }
-  void OnConfigurationChanged(const WorkerSettings&) override {}
-  void Run(NotifyWorkItem&) override {}
-  void RetryPass() override {}
-  void Stop() override {}
+  explicit NotificationWorkerJob(core::HostCallbackFn callback)
+      : m_callback(callback), m_writer(MakeAttachmentWriter(callback)) {}
+
+  void Start(const WorkerSettings& settings) override {
+    // Messages of an earlier run are never retried: their queue is gone.
+    ClearDataDirectory(m_callback);
+    m_helper = std::make_unique<NotifyHelper>(m_callback);
+    m_settings = settings;
+  }
+  bool HasPendingRetries() const override { return m_helper && !m_helper->Retries().Empty(); }
+  void OnConfigurationChanged(const WorkerSettings& settings) override {
+    NotifyFileStreamImpl stream(m_callback);
+    m_helper->Retries().Clear(*m_helper, stream);
+    m_settings = settings;
+  }
+  void Run(NotifyWorkItem& item) override {
+    NotifyFileStreamImpl stream(m_callback);
+    RunNotificationJob(item, *m_helper, stream, m_settings.maxRetryQueue, *m_writer);
+  }
+  void RetryPass() override {
+    NotifyFileStreamImpl stream(m_callback);
+    m_helper->Retries().RetryPass(*m_helper, stream, m_settings.maxRetrySeconds);
+  }
+  void Stop() override { m_helper.reset(); }
+
+ private:
+  core::HostCallbackFn m_callback;
+  std::unique_ptr<IAttachmentWriter> m_writer;
+  std::unique_ptr<NotifyHelper> m_helper;
+  WorkerSettings m_settings;
 };
 
 }  // namespace
 
-WorkerJobFactory DefaultWorkerJobFactory(core::HostCallbackFn) {
-  return [] { return std::make_unique<DroppingJob>(); };
+WorkerJobFactory DefaultWorkerJobFactory(core::HostCallbackFn callback) {
+  return [callback] { return std::make_unique<NotificationWorkerJob>(callback); };
 }
 
 }  // namespace hx
