@@ -6,6 +6,8 @@
 #define ALERTMOD_TESTS_SUPPORT_MODULE_HOOKS_H_
 
 #include <cstdint>
+#include <string>
+#include <vector>
 
 namespace testhooks {
 
@@ -27,6 +29,21 @@ using ApplyConfigurationUpdateFn = int32_t (*)(const char* text, uint32_t length
 // "ApplySecondReviewer": the same for the second reviewer setting of a full
 // document. 1 when the mode changed, 0 when not, -1 not applied.
 using ApplySecondReviewerFn = int32_t (*)(const char* text, uint32_t length);
+
+// What the "RunProcess" hook reports of one program run.
+struct ProcessRunResult {
+  bool ran = false;  // false: not started, or cut off by Close
+  int32_t exitCode = -1;
+  std::vector<std::string> errorLines;
+  std::string output;
+};
+// "RunProcess": runs `arguments` with `input` through the module's
+// process-service client, on the calling thread, and waits for the end.
+using RunProcessFn = void (*)(const std::vector<std::string>& arguments, const std::string& input,
+                              ProcessRunResult& result);
+// "SetLastProcessId": sets the last process id issued, so that the next start
+// takes the id after it.
+using SetLastProcessIdFn = void (*)(uint32_t id);
 
 }  // namespace testhooks
 

@@ -1,0 +1,245 @@
+#include <gtest/gtest.h>
+#include <sys/wait.h>
+
+#include <cerrno>
+#include <chrono>
+#include <future>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "tests/support/host_fixture.h"
+#include "tests/support/module_hooks.h"
+
+namespace {
+
+using testhooks::ProcessRunResult;
+using testsupport::ReadFile;
+
+constexpr auto kRunTimeout = std::chrono::seconds(30);
+
+uint32_t U32(const std::string& bytes, size_t offset) {
+  uint32_t value = 0;
+  for (int i = 3; i >= 0; --i) value = value << 8 | static_cast<unsigned char>(bytes[offset + i]);
+  return value;
+}
+
+struct SentMessage {
+  uint32_t length, id, type;
+};
+
+class HostProcessTest : public testsupport::ModuleHostTest {
+ protected:
+  void Start() {
+    StartHost();
+    m_run = reinterpret_cast<testhooks::RunProcessFn>(host().Hook("RunProcess"));
+    m_setLastId = reinterpret_cast<testhooks::SetLastProcessIdFn>(host().Hook("SetLastProcessId"));
+    ASSERT_NE(m_run, nullptr);
+    ASSERT_NE(m_setLastId, nullptr);
+  }
+
+  ProcessRunResult Run(const std::vector<std::string>& arguments, const std::string& input = "") {
+    ProcessRunResult result;
+    m_run(arguments, input, result);
+    return result;
+  }
+
+  // Runs on another thread; the result must be taken within the time-out.
+  std::future<ProcessRunResult> RunAsync(std::vector<std::string> arguments,
+                                         std::string input = "") {
+    return std::async(std::launch::async,
+                      [this, arguments, input] { return Run(arguments, input); });
+  }
+
+  // The result of a run started by RunAsync. A run that does not end is a
+  // failure; Close then releases it, so that the test ends.
+  ProcessRunResult Await(std::future<ProcessRunResult>& run) {
+    if (run.wait_for(kRunTimeout) != std::future_status::ready) {
+      ADD_FAILURE() << "the run did not end";
+      host().CloseModule();
+    }
+    return run.get();
+  }
+
+  std::vector<SentMessage> SentMessages() {
+    std::vector<SentMessage> messages;
+    for (const auto& request : host().Requests().OfClass(hx::core::kClassProcess)) {
+      messages.push_back({U32(request.bytes, 0), U32(request.bytes, 4), U32(request.bytes, 8)});
+    }
+    return messages;
+  }
+
+  // Waits until the module has sent `count` messages of `type`.
+  bool WaitForSent(uint32_t type, size_t count) {
+    return host().Requests().WaitFor(
+        [&](const std::vector<refhost::RecordedRequest>& requests) {
+          size_t seen = 0;
+          for (const auto& request : requests) {
+            if (request.requestClass == hx::core::kClassProcess && request.bytes.size() >= 16 &&
+                U32(request.bytes, 8) == type) {
+              ++seen;
+            }
+          }
+          return seen >= count;
+        },
+        std::chrono::seconds(20));
+  }
+
+  testhooks::RunProcessFn m_run = nullptr;
+  testhooks::SetLastProcessIdFn m_setLastId = nullptr;
+};
+
+TEST_F(HostProcessTest, ProgramsReportOutputAndExitCode) {
+  Start();
+  struct Case {
+    const char* script;
+    std::string input;
+    int32_t exitCode;
+    std::vector<std::string> errorLines;
+    std::string output;
+  };
+  const Case cases[] = {
+      {"echo out1; echo err1 >&2; printf 'err2\\r\\n' >&2; exit 3",
+       "",
+       3,
+       {"err1", "err2"},
+       "out1\n"},
+      {"printf last >&2", "", 0, {"last"}, ""},
+      // The carriage return and its line feed arrive in different pieces.
+      {"printf 'ab\\r' >&2; sleep 0.2; printf '\\ncd\\n' >&2", "", 0, {"ab", "cd"}, ""},
+      {"cat >&2", "x\ny", 0, {"x", "y"}, ""},
+      {"kill -TERM $$", "", 128 + 15, {}, ""},
+  };
+  for (const Case& c : cases) {
+    ProcessRunResult result = Run({"/bin/sh", "-c", c.script}, c.input);
+    EXPECT_TRUE(result.ran) << c.script;
+    EXPECT_EQ(result.exitCode, c.exitCode) << c.script;
+    EXPECT_EQ(result.errorLines, c.errorLines) << c.script;
+    EXPECT_EQ(result.output, c.output) << c.script;
+  }
+}
+
+TEST_F(HostProcessTest, LargeInputArrivesWhole) {
+  Start();
+  for (size_t length : {size_t{70000}, size_t{65520}, size_t{2 * 65520}}) {
+    std::string input(length, '\0');
+    for (size_t i = 0; i < length; ++i) input[i] = static_cast<char>('a' + i % 26);
+    host().Requests().Clear();
+    // A program that reads to the end of its input ends only when the host
+    // closes it, also when the input fills whole messages.
+    auto run = RunAsync({"/bin/sh", "-c", "cat > got.bin"}, input);
+    ProcessRunResult result = Await(run);
+    EXPECT_TRUE(result.ran);
+    EXPECT_EQ(result.exitCode, 0);
+    EXPECT_EQ(ReadFile(dir().File("got.bin")), input) << length;
+    std::vector<uint32_t> inputLengths;
+    for (const SentMessage& message : SentMessages()) {
+      if (message.type == 0) inputLengths.push_back(message.length);
+    }
+    std::vector<uint32_t> expected = length == 70000 ? std::vector<uint32_t>{65536, 4496}
+                                                     : std::vector<uint32_t>(length / 65520, 65536);
+    if (length % 65520 == 0) expected.push_back(16);
+    EXPECT_EQ(inputLengths, expected) << length;
+  }
+}
+
+TEST_F(HostProcessTest, TransferToolNameRunsTheConfiguredTool) {
+  Options().transferTool = "/bin/echo";
+  Start();
+  ProcessRunResult echoed = Run({"./curl", "--url", "smtp://x"});
+  EXPECT_TRUE(echoed.ran);
+  EXPECT_EQ(echoed.output, "--url smtp://x\n");
+}
+
+TEST_F(HostProcessTest, TransferToolIsCurlByDefault) {
+  Start();
+  ProcessRunResult version = Run({"./curl", "-V"});
+  ASSERT_TRUE(version.ran);
+  EXPECT_EQ(version.exitCode, 0);
+  EXPECT_EQ(version.output.rfind("curl ", 0), 0u) << version.output;
+  EXPECT_NE(version.output.find("smtp"), std::string::npos);
+}
+
+TEST_F(HostProcessTest, MissingProgramsFailToStart) {
+  Start();
+  for (const char* program : {"/nonexistent/tool", "no-such-program-on-path", ""}) {
+    ProcessRunResult result = Run({program, "x"});
+    EXPECT_FALSE(result.ran) << program;
+  }
+  // The service is still usable afterwards.
+  EXPECT_TRUE(Run({"/bin/true"}).ran);
+}
+
+TEST_F(HostProcessTest, StartAfterCloseSendsNothing) {
+  Start();
+  host().CloseModule();
+  const size_t sent = SentMessages().size();
+  EXPECT_FALSE(Run({"/bin/true"}).ran);
+  EXPECT_EQ(SentMessages().size(), sent);
+}
+
+TEST_F(HostProcessTest, CloseReleasesAWaitingRun) {
+  Start();
+  auto run = RunAsync({"/bin/sh", "-c", "sleep 60"});
+  ASSERT_TRUE(WaitForSent(0, 1));  // the input follows the answered start
+  host().CloseModule();
+  EXPECT_FALSE(Await(run).ran);
+  // Stopping the host ends the program and reaps it.
+  host().Stop();
+  errno = 0;
+  EXPECT_EQ(waitpid(-1, nullptr, WNOHANG), -1);
+  EXPECT_EQ(errno, ECHILD);
+}
+
+TEST_F(HostProcessTest, LoadAfterStopOpensTheServiceAgain) {
+  Start();
+  host().Stop();
+  Start();
+  ProcessRunResult result = Run({"/bin/sh", "-c", "exit 4"});
+  EXPECT_TRUE(result.ran);
+  EXPECT_EQ(result.exitCode, 4);
+}
+
+TEST_F(HostProcessTest, IdsWrapAroundToTheNextFreeOne) {
+  Start();
+  host().Requests().Clear();
+  m_setLastId(0xCFFFFF);
+  auto waiting = RunAsync({"/bin/sh", "-c", "while [ ! -e release ]; do sleep 0.05; done"});
+  ASSERT_TRUE(WaitForSent(0, 1));
+  m_setLastId(0xCFFFFF);
+  EXPECT_TRUE(Run({"/bin/true"}).ran);
+  ASSERT_TRUE(testsupport::WriteFile(dir().File("release"), ""));
+  EXPECT_TRUE(Await(waiting).ran);
+
+  std::vector<uint32_t> startIds;
+  for (const SentMessage& message : SentMessages()) {
+    if (message.type == 6) startIds.push_back(message.id);
+  }
+  EXPECT_EQ(startIds, (std::vector<uint32_t>{0xC00000, 0xC00001}));
+}
+
+TEST_F(HostProcessTest, ConcurrentRunsKeepTheirOwnOutput) {
+  Start();
+  std::vector<std::future<bool>> workers;
+  for (int worker = 0; worker < 4; ++worker) {
+    workers.push_back(std::async(std::launch::async, [this, worker] {
+      bool allRight = true;
+      for (int i = 0; i < 8; ++i) {
+        std::string tag = std::to_string(worker) + "-" + std::to_string(i);
+        ProcessRunResult result = Run({"/bin/sh", "-c", "cat >&2; exit " + std::to_string(i)}, tag);
+        allRight = allRight && result.ran && result.exitCode == i &&
+                   result.errorLines == std::vector<std::string>{tag};
+      }
+      return allRight;
+    }));
+  }
+  for (auto& worker : workers) {
+    if (worker.wait_for(kRunTimeout) != std::future_status::ready) {
+      ADD_FAILURE() << "a worker did not end";
+      host().CloseModule();
+    }
+    EXPECT_TRUE(worker.get());
+  }
+}
+
+}  // namespace
