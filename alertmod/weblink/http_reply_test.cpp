@@ -2,35 +2,17 @@
 
 #include <gtest/gtest.h>
 
-#include <algorithm>
 #include <boost/system/system_error.hpp>
 #include <stdexcept>
+
+#include "alertmod/weblink/testing/piecewise_reply_stream.h"
 
 namespace hx {
 namespace {
 
-// A reply that arrives in pieces of a fixed size.
-class PiecewiseStream final : public IReplyStream {
- public:
-  PiecewiseStream(std::string bytes, size_t piece) : m_bytes(std::move(bytes)), m_piece(piece) {}
-
-  bool ReadSome(std::string& buffer, const char*) override {
-    if (m_pos == m_bytes.size()) return false;
-    size_t count = std::min(m_piece, m_bytes.size() - m_pos);
-    buffer.append(m_bytes, m_pos, count);
-    m_pos += count;
-    return true;
-  }
-
- private:
-  std::string m_bytes;
-  size_t m_piece;
-  size_t m_pos = 0;
-};
-
 // The body, or the text of the failure.
 std::string Read(const std::string& reply, size_t piece) {
-  PiecewiseStream stream(reply, piece);
+  PiecewiseReplyStream stream(reply, piece);
   HttpResponse response;
   try {
     ReadHttpReply(stream, response);

@@ -1,7 +1,6 @@
 // Feeds arbitrary bytes to the web server reply reader, as a reply arriving
 // in pieces whose size the first byte chooses, and to the login-reply scanner
 // both through a successful reply and directly.
-#include <algorithm>
 #include <boost/system/system_error.hpp>
 #include <cstddef>
 #include <cstdint>
@@ -10,29 +9,12 @@
 
 #include "alertmod/weblink/http_reply.h"
 #include "alertmod/weblink/login_reply.h"
+#include "alertmod/weblink/testing/piecewise_reply_stream.h"
 
 namespace {
 
 constexpr char kSerial[] = "SN-1";
 constexpr size_t kLargestPiece = 64;
-
-class MemoryReplyStream final : public hx::IReplyStream {
- public:
-  MemoryReplyStream(const std::string& bytes, size_t piece) : m_bytes(bytes), m_piece(piece) {}
-
-  bool ReadSome(std::string& buffer, const char*) override {
-    if (m_pos == m_bytes.size()) return false;
-    size_t count = std::min(m_piece, m_bytes.size() - m_pos);
-    buffer.append(m_bytes, m_pos, count);
-    m_pos += count;
-    return true;
-  }
-
- private:
-  const std::string& m_bytes;
-  size_t m_piece;
-  size_t m_pos = 0;
-};
 
 void CheckLoginReply(const std::string& body) {
   hx::LoginReply login = hx::ParseLoginReply(body, kSerial);
@@ -45,7 +27,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   if (size == 0) return 0;
   const size_t piece = data[0] % kLargestPiece + 1;
   const std::string reply(reinterpret_cast<const char*>(data) + 1, size - 1);
-  MemoryReplyStream stream(reply, piece);
+  hx::PiecewiseReplyStream stream(reply, piece);
   hx::HttpResponse response;
   try {
     hx::ReadHttpReply(stream, response);
