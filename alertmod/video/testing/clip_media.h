@@ -61,6 +61,8 @@ class HostClip {
   // The whole host buffer of frame `i`, header included.
   const std::vector<uint8_t>& Buffer(size_t i) const { return m_buffers[i]; }
   size_t HeaderSize() const { return m_headerSize; }
+  // Makes frame `i` lose its buffer, as a frame the host took back.
+  void ClearBuffer(size_t i) { m_holders[i]->Clear(); }
 
  private:
   std::vector<std::vector<uint8_t>> m_buffers;

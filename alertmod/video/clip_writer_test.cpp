@@ -1,0 +1,271 @@
+#include "alertmod/video/clip_writer.h"
+
+#include <gtest/gtest.h>
+
+#include <string>
+
+#include "alertmod/diag/log.h"
+#include "alertmod/video/testing/clip_media.h"
+#include "tests/support/fake_host.h"
+#include "tests/support/temp_dir.h"
+
+namespace hx {
+namespace {
+
+using cliptest::HostClip;
+using cliptest::MediaFrame;
+using cliptest::MediaSpec;
+
+// Put in front of every payload, as the host does with its frame header.
+const std::string kHostHeader = "HOSTFRAMEHEADER-24-BYTES";
+
+class ClipWriterTest : public ::testing::Test {
+ protected:
+  void SetUp() override { ASSERT_TRUE(cliptest::HaveFfmpegTools()) << "ffmpeg and ffprobe needed"; }
+
+  std::vector<MediaFrame> Frames(const MediaSpec& spec) {
+    std::vector<MediaFrame> frames = cliptest::MakeFrames(spec, m_dir.path());
+    EXPECT_EQ(frames.size(), spec.frames) << "test media could not be made";
+    return frames;
+  }
+
+  bool Logged(uint32_t source, int32_t level, const std::string& text) {
+    for (const refhost::LogLine& line : m_host.Log().Lines()) {
+      if (line.source == source && line.level == level && line.text == text) return true;
+    }
+    return false;
+  }
+
+  testsupport::TempDir m_dir;
+  testsupport::FakeHost m_host;
+};
+
+// The first bytes of `payload` as the container should hold them: for H.264
+// and H.265 its first two NAL units, each behind a 4-byte length instead of
+// its start code; for MPEG-4 Part 2 the bytes unchanged.
+std::vector<uint8_t> ExpectedPacketStart(const std::vector<uint8_t>& payload, uint32_t codec) {
+  if (codec == kCodecMpeg4) return std::vector<uint8_t>(payload.begin(), payload.begin() + 16);
+  std::vector<size_t> starts;  // first byte after each start code
+  for (size_t i = 0; i + 3 <= payload.size() && starts.size() < 3; ++i) {
+    if (payload[i] == 0 && payload[i + 1] == 0 && payload[i + 2] == 1) starts.push_back(i + 3);
+  }
+  std::vector<uint8_t> expected;
+  for (size_t n = 0; n < 2 && n + 1 < starts.size(); ++n) {
+    size_t end = starts[n + 1] - 3;
+    while (end > starts[n] && payload[end - 1] == 0) --end;
+    const uint32_t length = static_cast<uint32_t>(end - starts[n]);
+    for (int shift : {24, 16, 8, 0}) expected.push_back(static_cast<uint8_t>(length >> shift));
+    expected.insert(expected.end(), payload.begin() + starts[n], payload.begin() + end);
+  }
+  return expected;
+}
+
+TEST_F(ClipWriterTest, ClipsPlayBackWithTheirStreamDescription) {
+  struct Case {
+    MediaSpec spec;
+    const char* extension;
+    const char* codecName;
+  };
+  const Case cases[] = {
+      {{kCodecH264, 1920, 1080, 50, 25}, ".mov", "h264"},
+      {{kCodecH264, 1280, 720, 50, 25}, ".mov", "h264"},
+      {{kCodecH265, 1920, 1080, 50, 25}, ".mp4", "hevc"},
+      {{kCodecH265, 1280, 720, 50, 25}, ".mp4", "hevc"},
+      {{kCodecMpeg4, 1280, 720, 50, 25}, ".mov", "mpeg4"},
+  };
+  for (const Case& c : cases) {
+    const std::string name = std::string(c.codecName) + std::to_string(c.spec.height);
+    SCOPED_TRACE(name);
+    const std::vector<MediaFrame> frames = Frames(c.spec);
+    ASSERT_FALSE(frames.empty());
+    HostClip clip(c.spec, frames, kHostHeader, 5000, 40);
+    std::vector<std::vector<uint8_t>> before;
+    for (size_t i = 0; i < frames.size(); ++i) before.push_back(clip.Buffer(i));
+    const std::string path = m_dir.File(name + c.extension);
+
+    ASSERT_TRUE(WriteVideoAttachment(9, clip.Stream(), path, m_host.callback()));
+
+    const auto probe = cliptest::Probe(path);
+    EXPECT_EQ(probe.at("codec_name"), c.codecName);
+    EXPECT_EQ(probe.at("width"), std::to_string(c.spec.width));
+    EXPECT_EQ(probe.at("height"), std::to_string(c.spec.height));
+    EXPECT_EQ(probe.at("nb_read_packets"), std::to_string(c.spec.frames));
+    // 50 frames over 1960 ms play at 51000 / 1960 = 26 frames per second.
+    EXPECT_EQ(probe.at("r_frame_rate"), "26/1");
+    if (c.spec.codec == kCodecH265) {
+      EXPECT_EQ(probe.at("codec_tag_string"), "hvc1");
+    }
+    EXPECT_EQ(probe.count("TAG:language") ? probe.at("TAG:language") : "", "eng");
+    EXPECT_FALSE(probe.count("TAG:creation_time") == 0 || probe.at("TAG:creation_time").empty());
+    EXPECT_EQ(cliptest::DecodeErrors(path), "");
+
+    const std::vector<uint8_t> file = cliptest::ReadBytes(path);
+    EXPECT_FALSE(cliptest::ContainsBoxType(cliptest::MoovBox(file), "elst"));
+    const auto boxes = cliptest::TopLevelBoxes(file);
+    ASSERT_GE(boxes.size(), 3u);
+    EXPECT_EQ(boxes[1].first, "moov");  // the reserved movie header comes first
+    EXPECT_EQ(boxes.back().first, "mdat");
+    EXPECT_GE(boxes.back().second, 16352u);
+
+    // Only the payload reaches the file, and the host's buffers stay as lent.
+    const long offset = cliptest::FirstPacketOffset(path);
+    ASSERT_GT(offset, 0);
+    const std::vector<uint8_t> expected = ExpectedPacketStart(frames[0].payload, c.spec.codec);
+    ASSERT_GE(expected.size(), 8u);
+    ASSERT_GT(file.size(), offset + expected.size());
+    EXPECT_EQ(std::vector<uint8_t>(file.begin() + offset, file.begin() + offset + expected.size()),
+              expected);
+    for (size_t i = 0; i < frames.size(); ++i) ASSERT_EQ(clip.Buffer(i), before[i]) << i;
+  }
+}
+
+TEST_F(ClipWriterTest, FrameRateComesFromTheArrivalSpan) {
+  struct Case {
+    const char* name;
+    std::vector<uint32_t> arrivals;
+    const char* rate;
+  };
+  const Case cases[] = {
+      {"one frame counts a span of 1 ms", {7000}, "2000/1"},
+      {"two frames 100 ms apart", {7000, 7100}, "30/1"},
+      {"sparse frames still play", {7000, 12000}, "1/1"},
+  };
+  const MediaSpec spec{kCodecH264, 320, 240, 2, 1};
+  const std::vector<MediaFrame> frames = Frames(spec);
+  ASSERT_EQ(frames.size(), 2u);
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    const std::vector<MediaFrame> used(frames.begin(), frames.begin() + c.arrivals.size());
+    HostClip clip(spec, used, kHostHeader, c.arrivals);
+    const std::string path = m_dir.File("rate.mov");
+    ASSERT_TRUE(WriteVideoAttachment(1, clip.Stream(), path, m_host.callback()));
+    const auto probe = cliptest::Probe(path);
+    EXPECT_EQ(probe.at("r_frame_rate"), c.rate);
+    EXPECT_EQ(probe.at("nb_read_packets"), std::to_string(c.arrivals.size()));
+    EXPECT_EQ(cliptest::DecodeErrors(path), "");
+  }
+}
+
+TEST_F(ClipWriterTest, LateKeyFramesAreLoggedAndWritten) {
+  const MediaSpec spec{kCodecH264, 320, 240, 15, 5};
+  const std::vector<MediaFrame> frames = Frames(spec);
+  ASSERT_EQ(frames.size(), 15u);
+  // Key frames at 0, 5 and 10; the one at 5 comes exactly 1500 ms late, the
+  // one at 10 comes 1640 ms late.
+  std::vector<uint32_t> arrivals;
+  uint32_t now = 10000;
+  for (size_t i = 0; i < frames.size(); ++i) {
+    now += i == 5 ? 1500 : i == 10 ? 1640 : 40;
+    arrivals.push_back(now);
+  }
+  HostClip clip(spec, frames, kHostHeader, arrivals);
+  const std::string path = m_dir.File("gap.mov");
+  ASSERT_TRUE(WriteVideoAttachment(4, clip.Stream(), path, m_host.callback()));
+
+  EXPECT_TRUE(Logged(core::kClipWriterLogSource, LogLevelError,
+                     "Existing at full_ts - m_activeClip->LastFrame gap is 1640"));
+  EXPECT_FALSE(Logged(core::kClipWriterLogSource, LogLevelError,
+                      "Existing at full_ts - m_activeClip->LastFrame gap is 1500"));
+  EXPECT_EQ(cliptest::Probe(path).at("nb_read_packets"), "15");
+}
+
+TEST_F(ClipWriterTest, ArrivalTicksThatWrapKeepTheWholeClip) {
+  const MediaSpec spec{kCodecH264, 320, 240, 25, 25};
+  const std::vector<MediaFrame> frames = Frames(spec);
+  // The eleventh frame arrives at tick 0 exactly.
+  HostClip clip(spec, frames, kHostHeader, 0u - 400u, 40);
+  const std::string path = m_dir.File("wrap.mov");
+  ASSERT_TRUE(WriteVideoAttachment(2, clip.Stream(), path, m_host.callback()));
+  EXPECT_EQ(cliptest::Probe(path).at("nb_read_packets"), "25");
+  EXPECT_EQ(cliptest::DecodeErrors(path), "");
+}
+
+TEST_F(ClipWriterTest, CodecsWithoutAContainerAreRefused) {
+  for (uint32_t codec : {kCodecJpeg, 3u, 7u}) {
+    SCOPED_TRACE(codec);
+    MediaSpec spec{codec, 320, 240, 1, 1};
+    HostClip clip(spec, {MediaFrame{{1, 2, 3}, true}}, kHostHeader, 100, 40);
+    const std::string path = m_dir.File("refused.mov");
+    EXPECT_FALSE(WriteVideoAttachment(2, clip.Stream(), path, m_host.callback()));
+    EXPECT_FALSE(testsupport::FileExists(path));
+  }
+  EXPECT_TRUE(Logged(core::kModuleId, LogLevelWarning, "Invalid codec type received."));
+}
+
+TEST_F(ClipWriterTest, FilesThatCannotBeStartedAreLogged) {
+  const MediaSpec spec{kCodecH264, 320, 240, 10, 5};
+  const std::vector<MediaFrame> frames = Frames(spec);
+  HostClip clip(spec, frames, kHostHeader, 100, 40);
+  for (const std::string& path : {m_dir.File("missing/clip.mov"), m_dir.File("clip.unknown")}) {
+    SCOPED_TRACE(path);
+    EXPECT_TRUE(WriteVideoAttachment(12, clip.Stream(), path, m_host.callback()));
+    EXPECT_FALSE(testsupport::FileExists(path));
+  }
+  // One line per key frame: each retries the open.
+  size_t lines = 0;
+  for (const refhost::LogLine& line : m_host.Log().Lines()) {
+    if (line.source == core::kClipWriterLogSource && line.level == LogLevelError &&
+        line.text == "failed to start mp4/mov file for 12: -1") {
+      ++lines;
+    }
+  }
+  EXPECT_EQ(lines, 4u);
+}
+
+TEST_F(ClipWriterTest, ClipsTooLongForTheReservedHeaderLeaveNoBrokenFile) {
+  // Many short groups of pictures outgrow the 16352 bytes kept for the
+  // movie header; the container then cannot be finished.
+  const MediaSpec spec{kCodecH264, 64, 64, 3600, 2};
+  const std::vector<MediaFrame> frames = Frames(spec);
+  ASSERT_EQ(frames.size(), 3600u);
+  HostClip clip(spec, frames, kHostHeader, 100, 33);
+  const std::string path = m_dir.File("long.mov");
+  EXPECT_TRUE(WriteVideoAttachment(5, clip.Stream(), path, m_host.callback()));
+  EXPECT_FALSE(testsupport::FileExists(path));
+  EXPECT_TRUE(Logged(core::kClipWriterLogSource, LogLevelError,
+                     "failed to finish mp4/mov file for 5: -22"));
+}
+
+TEST_F(ClipWriterTest, JpegStillIsThePayloadOfTheFirstFrame) {
+  const std::string source = m_dir.File("still.jpg");
+  int status = -1;
+  cliptest::RunCommand("ffmpeg -v error -y -f lavfi -i testsrc2=size=320x240 -frames:v 1 " + source,
+                       &status);
+  ASSERT_EQ(status, 0);
+  const std::vector<uint8_t> still = cliptest::ReadBytes(source);
+  MediaSpec spec{kCodecJpeg, 320, 240, 2, 1};
+  HostClip clip(spec, {MediaFrame{still, true}, MediaFrame{{9, 9, 9}, true}}, kHostHeader, 100, 40);
+  const std::string path = m_dir.File("attachment.jpg");
+  ASSERT_TRUE(WriteJpegAttachment(clip.Stream(), path));
+  EXPECT_EQ(cliptest::ReadBytes(path), still);
+  EXPECT_EQ(cliptest::Probe(path).at("codec_name"), "mjpeg");
+}
+
+TEST_F(ClipWriterTest, JpegStillFailures) {
+  MediaSpec spec{kCodecJpeg, 320, 240, 1, 1};
+  const std::vector<uint8_t> still = {0xFF, 0xD8, 0xFF, 0xD9};
+  HostClip empty(spec, {}, kHostHeader, 100, 40);
+  HostClip good(spec, {MediaFrame{still, true}}, kHostHeader, 100, 40);
+  HostClip headerOnly(spec, {MediaFrame{{}, true}}, kHostHeader, 100, 40);
+  HostClip taken(spec, {MediaFrame{still, true}}, kHostHeader, 100, 40);
+  taken.ClearBuffer(0);
+  struct Case {
+    const char* name;
+    const HostClip& clip;
+    std::string path;
+  };
+  const Case cases[] = {
+      {"empty clip", empty, m_dir.File("a.jpg")},
+      {"empty path", good, ""},
+      {"buffer taken back", taken, m_dir.File("b.jpg")},
+      {"no payload", headerOnly, m_dir.File("c.jpg")},
+      {"directory missing", good, m_dir.File("missing/d.jpg")},
+      {"disk full", good, "/dev/full"},
+  };
+  for (const Case& c : cases) {
+    EXPECT_FALSE(WriteJpegAttachment(c.clip.Stream(), c.path)) << c.name;
+  }
+}
+
+}  // namespace
+}  // namespace hx
