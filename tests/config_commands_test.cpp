@@ -5,7 +5,9 @@
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <tinyxml.h>
+#include <unistd.h>
 
+#include <cstdio>
 #include <string>
 #include <vector>
 
@@ -328,6 +330,47 @@ TEST_F(ConfigCommandsTest, SmtpsIsOfferedOnlyWhenTheTransferToolListsIt) {
     EXPECT_EQ(AttributeOf(ReadFile("notify.xml"), "Notify", "SSL"), c.ssl);
     host().Stop();
   }
+}
+
+TEST_F(ConfigCommandsTest, FailedSaveIsLoggedAndTheConfigurationStillPosted) {
+  // A working directory that no longer exists makes every save fail.
+  const std::string gone = dir().File("gone");
+  ASSERT_EQ(mkdir(gone.c_str(), 0755), 0);
+  ASSERT_EQ(chdir(gone.c_str()), 0);
+  ASSERT_EQ(rmdir(gone.c_str()), 0);
+  StartHost();
+  EXPECT_TRUE(Logged("Unable to save the configuration to notify.xml: create error "));
+  EXPECT_EQ(PostCount(), 1u);
+  host().Stop();
+  ASSERT_EQ(chdir(dir().path().c_str()), 0);
+}
+
+// The output of a command, and its exit status.
+std::string RunCommand(const std::string& command, int* status) {
+  std::string output;
+  FILE* pipe = popen(command.c_str(), "r");
+  if (pipe == nullptr) return output;
+  char buffer[4096];
+  for (size_t n; (n = fread(buffer, 1, sizeof(buffer), pipe)) > 0;) output.append(buffer, n);
+  *status = pclose(pipe);
+  return output;
+}
+
+TEST(HostProgramTest, ShowsThePostedConfigurationWithMaskedPasswords) {
+  testsupport::TempDir dir;
+  testsupport::ScopedChdir chdir(dir.path());
+  ASSERT_TRUE(WriteFile(
+      "notify.xml", "<Trellan>" + Notify(Server("main", kPassword), Profile(1)) + "</Trellan>"));
+  int status = -1;
+  std::string output =
+      RunCommand(std::string(ALERTMOD_HOST_PROGRAM) + " --seconds 0 --show-config --module " +
+                     testsupport::ProductionModulePath() + " 2>&1",
+                 &status);
+  EXPECT_EQ(status, 0) << output;
+  EXPECT_NE(output.find("Configuration posted by the module:"), std::string::npos) << output;
+  EXPECT_NE(output.find("<Authentication username=\"u\" password=\"***\" />"), std::string::npos)
+      << output;
+  EXPECT_EQ(output.find(kPassword), std::string::npos) << output;
 }
 
 }  // namespace
