@@ -55,10 +55,8 @@ bool LoadCompleteSideFile(TiXmlDocument& document, const std::string& sideName) 
 }  // namespace
 
 FileNameGuard& FileNameGuard::Instance() {
-  // Never destroyed: a save may still run on a host thread while the
-  // library's static objects are torn down.
-  static FileNameGuard* guard = new FileNameGuard();
-  return *guard;
+  static FileNameGuard guard;
+  return guard;
 }
 
 void FileNameGuard::Acquire(const std::string& name) {

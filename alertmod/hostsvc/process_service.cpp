@@ -15,10 +15,10 @@ namespace {
 class ProcessRegistry final {
  public:
   static ProcessRegistry& Instance() {
-    // Never destroyed: host threads may deliver messages while the
-    // library's static objects are torn down.
-    static ProcessRegistry* registry = new ProcessRegistry();
-    return *registry;
+    // Destroyed when the library is unloaded, after the host has stopped
+    // calling into it; a heap object would leak at every unload.
+    static ProcessRegistry registry;
+    return registry;
   }
 
   std::mutex lock;
