@@ -26,9 +26,19 @@ constexpr char kPython[] = "/usr/bin/python3";
 constexpr char kBoundaryLine[] = "--b1914efc629febb89915e8a6f83ba6eb";
 constexpr char kMessagePath[] = "./data/notify-mail-3-1700000000-250-7";
 
-// Composition time: 2024-01-02 09:00:00 UTC.
+// Composition time while a test runs: 2024-01-02 09:00:00 UTC. The source is
+// installed once per process and never replaced, since a replaced clock
+// source is never freed.
+bool g_fixedCompositionTime = false;
+
 int64_t CompositionTime(void*) {
-  return 1704186000;
+  return g_fixedCompositionTime ? 1704186000 : static_cast<int64_t>(time(nullptr));
+}
+
+void FixCompositionTime(bool fixed) {
+  static const bool installed = (platform::SetWallSource(&CompositionTime, nullptr), true);
+  (void)installed;
+  g_fixedCompositionTime = fixed;
 }
 
 // Deterministic bytes that exercise every byte value.
@@ -76,12 +86,12 @@ class MailFileTest : public ::testing::Test {
     setenv("TZ", "CET-1CEST,M3.5.0,M10.5.0/3", 1);
     tzset();
     setlocale(LC_ALL, "C");
-    platform::SetWallSource(&CompositionTime, nullptr);
+    FixCompositionTime(true);
     m_chdir = std::make_unique<testsupport::ScopedChdir>(m_dir.path());
     ASSERT_EQ(mkdir("data", 0777), 0);
   }
 
-  void TearDown() override { platform::SetWallSource(nullptr, nullptr); }
+  void TearDown() override { FixCompositionTime(false); }
 
   static NotifyWorkItem Item() {
     NotifyWorkItem item(kWorkItemNotification);

@@ -5,10 +5,10 @@
 #include <sys/statvfs.h>
 #include <unistd.h>
 
-#include <atomic>
 #include <cerrno>
 #include <climits>
 #include <memory>
+#include <mutex>
 
 #include "alertmod/platform/error_text.h"
 
@@ -16,12 +16,18 @@ namespace hx {
 namespace platform {
 namespace {
 
+// The replacement query and its context, read and written as one pair. A
+// query of free space is rare enough for a lock.
 struct FreeBytesSource {
-  FreeBytesQuery query;
-  void* context;
+  std::mutex mutex;
+  FreeBytesQuery query = nullptr;
+  void* context = nullptr;
 };
 
-std::atomic<const FreeBytesSource*> g_freeBytesSource{nullptr};
+FreeBytesSource& TheFreeBytesSource() {
+  static FreeBytesSource source;
+  return source;
+}
 
 FsStatus ErrnoFailure(const char* action, const std::string& path, int error) {
   return FsStatus::Failure(std::string(action) + " \"" + path + "\": " + ErrorText(error));
@@ -100,16 +106,22 @@ FsStatus ListRegularFiles(const std::string& directory, std::vector<std::string>
 }
 
 FsStatus QueryFreeBytes(const std::string& directory, uint64_t* bytes) {
-  const FreeBytesSource* source = g_freeBytesSource.load(std::memory_order_acquire);
-  return source ? source->query(source->context, directory, bytes)
-                : SystemFreeBytes(directory, bytes);
+  FreeBytesSource& source = TheFreeBytesSource();
+  FreeBytesQuery query;
+  void* context;
+  {
+    std::lock_guard<std::mutex> lock(source.mutex);
+    query = source.query;
+    context = source.context;
+  }
+  return query ? query(context, directory, bytes) : SystemFreeBytes(directory, bytes);
 }
 
 void SetFreeBytesQuery(FreeBytesQuery query, void* context) {
-  // Replaced sources are leaked on purpose: another thread may still be
-  // calling through the old one. Tests install a handful at most.
-  const FreeBytesSource* next = query ? new FreeBytesSource{query, context} : nullptr;
-  g_freeBytesSource.store(next, std::memory_order_release);
+  FreeBytesSource& source = TheFreeBytesSource();
+  std::lock_guard<std::mutex> lock(source.mutex);
+  source.query = query;
+  source.context = context;
 }
 
 }  // namespace platform
