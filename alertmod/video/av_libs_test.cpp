@@ -9,6 +9,9 @@
 #include <map>
 #include <string>
 
+#include "alertmod/video/clip_writer.h"
+#include "alertmod/video/testing/clip_media.h"
+#include "tests/support/fake_host.h"
 #include "tests/support/temp_dir.h"
 
 namespace hx {
@@ -160,6 +163,59 @@ TEST(CodecLibrariesTest, EmptyDirectoryLoadsNothing) {
   EXPECT_FALSE(libs.Reload());
   EXPECT_FALSE(static_cast<AVCodecLib&>(libs).HasModule());
   EXPECT_EQ(libs.avcodec_find_decoder, nullptr);
+}
+
+// Clips through a set of libraries in a directory of the test's making.
+class ClipLibrariesTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    ASSERT_TRUE(cliptest::HaveFfmpegTools()) << "ffmpeg and ffprobe needed";
+    m_frames = cliptest::MakeFrames(m_spec, m_media.path());
+    ASSERT_EQ(m_frames.size(), m_spec.frames);
+    m_clip = std::make_unique<cliptest::HostClip>(m_spec, m_frames, "HEADER", 1000, 40);
+  }
+
+  bool WriteClip(av_init& libs, const std::string& path) {
+    return WriteVideoAttachment(1, m_clip->Stream(), path, m_host.callback(), libs);
+  }
+
+  const cliptest::MediaSpec m_spec{kCodecH264, 320, 240, 10, 5};
+  testsupport::TempDir m_media;
+  testsupport::FakeHost m_host;
+  std::vector<cliptest::MediaFrame> m_frames;
+  std::unique_ptr<cliptest::HostClip> m_clip;
+};
+
+TEST_F(ClipLibrariesTest, NoClipWithoutTheWholeSet) {
+  struct Case {
+    const char* name;
+    std::string swresampleTarget;
+  };
+  const Case cases[] = {{"missing", ""}, {"lacking", STUB_AV_LACKING}};
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    LibraryDirectory dir;
+    dir.LinkAll();
+    dir.Set("libswresample.so.4", c.swresampleTarget);
+    av_init libs(dir.path());
+    const std::string path = m_media.File(std::string(c.name) + ".mov");
+    EXPECT_TRUE(WriteClip(libs, path));
+    EXPECT_FALSE(testsupport::FileExists(path));
+  }
+}
+
+TEST_F(ClipLibrariesTest, ClipAfterAFailedStartReloadsTheSet) {
+  LibraryDirectory dir;
+  dir.LinkAll();
+  dir.Set("libswresample.so.4", "");
+  av_init libs(dir.path());
+  ASSERT_FALSE(libs.AllLoaded());
+  dir.Set("libswresample.so.4", dir.RealTarget("libswresample.so.4"));
+  const std::string path = m_media.File("reloaded.mov");
+  EXPECT_TRUE(WriteClip(libs, path));
+  EXPECT_TRUE(libs.AllLoaded());
+  EXPECT_EQ(cliptest::Probe(path).at("nb_read_packets"), "10");
+  EXPECT_EQ(cliptest::DecodeErrors(path), "");
 }
 
 }  // namespace
