@@ -13,9 +13,11 @@ int64_t g_now = 0;
 class ModuleRepliesTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    platform::SetWallSource([](void*) { return g_now; }, nullptr);
+    // Installed once: a replaced clock source is never freed.
+    static const bool installed =
+        (platform::SetWallSource([](void*) { return g_now; }, nullptr), true);
+    (void)installed;
   }
-  void TearDown() override { platform::SetWallSource(nullptr, nullptr); }
 
   testsupport::FakeHost m_host;
 };

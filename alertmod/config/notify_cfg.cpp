@@ -16,6 +16,7 @@ constexpr int32_t kDefaultSmtpPort = 25;
 constexpr int32_t kSmtpsPort = 465;
 constexpr int32_t kSmtpsMode = 1;
 constexpr char kEncryptMarker[] = "algo";
+constexpr int64_t kBytesPerMB = 1048576;
 
 void Report(const ConfigServices& services, const std::string& text) {
   if (services.errorSink) services.errorSink(text);
@@ -341,7 +342,7 @@ int32_t NotifyCfg::PreAlarmSeconds(int32_t actionId) const {
 int64_t NotifyCfg::EmailSizeLimitBytes() const {
   // Computed wide and clamped: the 32-bit product overflows from 2048 MiB
   // on, and a negative limit would read as an enormous unsigned one.
-  int64_t bytes = int64_t{m_emailSizeLimitMB} << 20;
+  int64_t bytes = int64_t{m_emailSizeLimitMB} * kBytesPerMB;
   return std::clamp<int64_t>(bytes, 0, kMaxEmailSizeLimitBytes);
 }
 
