@@ -10,6 +10,7 @@
 #include "alertmod/mail/notify_file.h"
 #include "alertmod/platform/clock.h"
 #include "alertmod/platform/file_system.h"
+#include "alertmod/platform/local_time.h"
 
 namespace hx {
 namespace {
@@ -50,10 +51,11 @@ std::string MailFileName(const NotifyWorkItem& item, uint32_t part, uint32_t tot
 }
 
 std::string DateLine() {
-  time_t now = static_cast<time_t>(platform::WallSeconds());
-  struct tm local {};
+  std::tm local{};
   char text[128] = {0};
-  if (localtime_r(&now, &local) != nullptr) strftime(text, sizeof(text), kDateFormat, &local);
+  if (platform::LocalFields(platform::WallSeconds(), &local)) {
+    strftime(text, sizeof(text), kDateFormat, &local);
+  }
   return std::string("Date: ") + text + kCrLf;
 }
 

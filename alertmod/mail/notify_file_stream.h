@@ -55,8 +55,8 @@ class INotifyFileStream {
   // True when `directory` was created or already exists; false on a
   // file-system error.
   virtual bool CreateDirectory(const std::string& directory) = 0;
-  // Removes the file `path`; false on a file-system error, a missing file
-  // included.
+  // Removes the file `path`; false on a file-system error. A file that is
+  // already gone is no error.
   virtual bool RemoveFile(const std::string& path) = 0;
 };
 

@@ -9,6 +9,7 @@
 
 #include "alertmod/diag/log.h"
 #include "alertmod/mail/event_types.h"
+#include "alertmod/platform/local_time.h"
 #include "alertmod/weblink/web_link.h"
 
 namespace hx {
@@ -110,9 +111,8 @@ bool IsValidFormat(const char* format) {
 
 std::string FormatDateElement(const TiXmlElement& element, int64_t eventTime,
                               const char* defaultFormat) {
-  time_t seconds = static_cast<time_t>(eventTime);
-  struct tm local {};
-  if (localtime_r(&seconds, &local) == nullptr) return std::string();
+  std::tm local{};
+  if (!platform::LocalFields(eventTime, &local)) return std::string();
   const char* format = element.Attribute("format");
   if (format == nullptr) {
     format = defaultFormat;

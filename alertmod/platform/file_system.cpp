@@ -11,6 +11,7 @@
 #include <mutex>
 
 #include "alertmod/platform/error_text.h"
+#include "alertmod/platform/files.h"
 
 namespace hx {
 namespace platform {
@@ -81,8 +82,8 @@ FsStatus MakeDirectory(const std::string& path) {
 }
 
 FsStatus DeleteFile(const std::string& path) {
-  if (unlink(path.c_str()) == 0) return FsStatus::Success();
-  return ErrnoFailure("cannot remove", path, errno);
+  int error = RemoveFile(path);
+  return error == 0 ? FsStatus::Success() : ErrnoFailure("cannot remove", path, error);
 }
 
 FsStatus ListRegularFiles(const std::string& directory, std::vector<std::string>* names,

@@ -33,7 +33,7 @@ FsStatus AbsolutePath(const std::string& relative, std::string* absolute);
 // that name.
 FsStatus MakeDirectory(const std::string& path);
 
-// Removes the file `path`. A missing file is a failure.
+// Removes the file `path`; a file that is already gone is no error.
 FsStatus DeleteFile(const std::string& path);
 
 // The names of the regular files in `directory` (symbolic links followed),
