@@ -8,10 +8,14 @@
 #include <cstdlib>
 #include <cstring>
 #include <fstream>
+#include <memory>
 #include <sstream>
 #include <string>
 #include <thread>
+#include <utility>
+#include <vector>
 
+#include "host/camera_feed.h"
 #include "host/reference_host.h"
 
 namespace {
@@ -22,6 +26,8 @@ struct CommandLine {
   bool help = false;
   bool showConfig = false;
   std::string updateFile;
+  std::vector<std::pair<uint32_t, std::string>> feeds;  // stream id, video file
+  bool fastFeeds = false;
   std::string error;
 };
 
@@ -39,6 +45,10 @@ const char kUsage[] =
     "                     element, or a whole Trellan document)\n"
     "  --show-config      print the configuration the module posted last, passwords\n"
     "                     shown as ***\n"
+    "  --feed ID=FILE     play the video FILE (H.264, H.265, MPEG-4 or MJPEG) as camera\n"
+    "                     stream ID, again and again while the module runs; repeatable\n"
+    "  --fast-feeds       push feed frames as fast as the module takes them instead of\n"
+    "                     at the files' frame rates\n"
     "  --help             show this text\n";
 
 std::string DefaultModulePath() {
@@ -57,6 +67,16 @@ bool ParseInt(const char* text, int* value) {
   return true;
 }
 
+// "ID=FILE" with a decimal stream id.
+bool ParseFeed(const std::string& text, std::vector<std::pair<uint32_t, std::string>>* feeds) {
+  const size_t equals = text.find('=');
+  int id = 0;
+  if (equals == std::string::npos || equals + 1 == text.size()) return false;
+  if (!ParseInt(text.substr(0, equals).c_str(), &id) || id < 0) return false;
+  feeds->emplace_back(static_cast<uint32_t>(id), text.substr(equals + 1));
+  return true;
+}
+
 CommandLine Parse(int argc, char** argv) {
   CommandLine cl;
   cl.host.modulePath = DefaultModulePath();
@@ -72,6 +92,10 @@ CommandLine Parse(int argc, char** argv) {
       cl.host.logFile = argv[++i];
     } else if (arg == "--update" && value) {
       cl.updateFile = argv[++i];
+    } else if (arg == "--feed" && value && ParseFeed(value, &cl.feeds)) {
+      ++i;
+    } else if (arg == "--fast-feeds") {
+      cl.fastFeeds = true;
     } else if (arg == "--show-config") {
       cl.showConfig = true;
     } else if (arg == "--seconds" && value && ParseInt(value, &number) && number >= 0) {
@@ -103,6 +127,38 @@ bool ReadWholeFile(const std::string& path, std::string* text) {
   content << in.rdbuf();
   *text = content.str();
   return true;
+}
+
+using Feeds = std::vector<std::unique_ptr<refhost::CameraFeed>>;
+
+bool StartFeeds(const CommandLine& cl, refhost::ReferenceHost& host, Feeds* feeds) {
+  for (const auto& entry : cl.feeds) {
+    refhost::FeedOptions options;
+    options.streamId = entry.first;
+    options.path = entry.second;
+    options.realTime = !cl.fastFeeds;
+    options.loops = 0;
+    feeds->push_back(std::make_unique<refhost::CameraFeed>(host, host.Frames(), options));
+    std::string error;
+    if (!feeds->back()->Start(&error)) {
+      fprintf(stderr, "alertmod-host: cannot play %s: %s\n", entry.second.c_str(), error.c_str());
+      return false;
+    }
+  }
+  return true;
+}
+
+void PrintFeeds(const CommandLine& cl, const Feeds& feeds, refhost::FramePool& frames) {
+  for (size_t i = 0; i < feeds.size(); ++i) {
+    const refhost::FeedStats stats = feeds[i]->Stats();
+    printf("Stream %u (%s): %llu frames, %llu kept, %llu refused\n", cl.feeds[i].first,
+           cl.feeds[i].second.c_str(), static_cast<unsigned long long>(stats.frames),
+           static_cast<unsigned long long>(stats.kept),
+           static_cast<unsigned long long>(stats.refused));
+  }
+  const std::string faults = frames.FaultReport();
+  if (feeds.empty()) return;
+  printf("Frame buffers: %s\n", faults.empty() ? "all returned" : faults.c_str());
 }
 
 void PrintConfiguration(refhost::ConfigStore& store) {
@@ -141,10 +197,14 @@ int main(int argc, char** argv) {
   }
   printf("Module loaded from %s; running for %d s.\n", cl.host.modulePath.c_str(), cl.seconds);
   if (!cl.updateFile.empty()) host.SendConfigurationUpdate(update);
-  std::this_thread::sleep_for(std::chrono::seconds(cl.seconds));
+  Feeds feeds;
+  const bool fed = StartFeeds(cl, host, &feeds);
+  if (fed) std::this_thread::sleep_for(std::chrono::seconds(cl.seconds));
+  for (auto& feed : feeds) feed->Stop();  // before the host, which they write to
   host.Stop();
   printf("Module stopped.\n");
+  PrintFeeds(cl, feeds, host.Frames());
   PrintModuleLog(host, host.Log());
   if (cl.showConfig) PrintConfiguration(host.Config());
-  return 0;
+  return fed ? 0 : 1;
 }
