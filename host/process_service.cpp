@@ -287,6 +287,10 @@ void ProcessService::Pump(const std::shared_ptr<Run>& run) {
   SetNonBlocking(run->stderrFd);
   Deliver(run->id, kProcessRunning, run->pid, nullptr, 0);
   PumpUntilExit(*run);
+  // Children the program left behind would keep its pipes open and outlive
+  // the run. The program itself is not reaped yet, so its group id cannot
+  // name anyone else.
+  if (run->pidFd >= 0) kill(-run->pid, SIGKILL);
   // The program's last output is still in the pipes.
   for (int i = 0; i < kMaxDrainReads && run->stdoutFd >= 0; ++i) {
     if (!ForwardOutput(*run, run->stdoutFd, kProcessOutput)) break;

@@ -3,7 +3,9 @@
 
 #include <cerrno>
 #include <chrono>
+#include <condition_variable>
 #include <future>
+#include <mutex>
 #include <string>
 #include <thread>
 #include <vector>
@@ -22,6 +24,20 @@ uint32_t U32(const std::string& bytes, size_t offset) {
   uint32_t value = 0;
   for (int i = 3; i >= 0; --i) value = value << 8 | static_cast<unsigned char>(bytes[offset + i]);
   return value;
+}
+
+std::string Message(uint32_t length, uint32_t id, uint32_t type, uint32_t value,
+                    const std::string& payload) {
+  std::string message(16, '\0');
+  const uint32_t fields[4] = {length, id, type, value};
+  for (int f = 0; f < 4; ++f) {
+    for (int i = 0; i < 4; ++i) message[f * 4 + i] = static_cast<char>(fields[f] >> (8 * i));
+  }
+  return message + payload;
+}
+
+std::string Message(uint32_t id, uint32_t type, uint32_t value, const std::string& payload) {
+  return Message(static_cast<uint32_t>(16 + payload.size()), id, type, value, payload);
 }
 
 struct SentMessage {
@@ -90,7 +106,7 @@ class HostProcessTest : public testsupport::ModuleHostTest {
 };
 
 TEST_F(HostProcessTest, ProgramsReportOutputAndExitCode) {
-  Start();
+  ASSERT_NO_FATAL_FAILURE(Start());
   struct Case {
     const char* script;
     std::string input;
@@ -109,6 +125,10 @@ TEST_F(HostProcessTest, ProgramsReportOutputAndExitCode) {
       {"printf 'ab\\r' >&2; sleep 0.2; printf '\\ncd\\n' >&2", "", 0, {"ab", "cd"}, ""},
       {"cat >&2", "x\ny", 0, {"x", "y"}, ""},
       {"kill -TERM $$", "", 128 + 15, {}, ""},
+      // Input the program never reads is dropped, not fatal to the host.
+      {"exit 5", std::string(300000, 'i'), 5, {}, ""},
+      // A child left behind does not hold the run open.
+      {"sleep 30 & echo started", "", 0, {}, "started\n"},
   };
   for (const Case& c : cases) {
     ProcessRunResult result = Run({"/bin/sh", "-c", c.script}, c.input);
@@ -120,7 +140,7 @@ TEST_F(HostProcessTest, ProgramsReportOutputAndExitCode) {
 }
 
 TEST_F(HostProcessTest, LargeInputArrivesWhole) {
-  Start();
+  ASSERT_NO_FATAL_FAILURE(Start());
   for (size_t length : {size_t{70000}, size_t{65520}, size_t{2 * 65520}}) {
     std::string input(length, '\0');
     for (size_t i = 0; i < length; ++i) input[i] = static_cast<char>('a' + i % 26);
@@ -145,14 +165,14 @@ TEST_F(HostProcessTest, LargeInputArrivesWhole) {
 
 TEST_F(HostProcessTest, TransferToolNameRunsTheConfiguredTool) {
   Options().transferTool = "/bin/echo";
-  Start();
+  ASSERT_NO_FATAL_FAILURE(Start());
   ProcessRunResult echoed = Run({"./curl", "--url", "smtp://x"});
   EXPECT_TRUE(echoed.ran);
   EXPECT_EQ(echoed.output, "--url smtp://x\n");
 }
 
 TEST_F(HostProcessTest, TransferToolIsCurlByDefault) {
-  Start();
+  ASSERT_NO_FATAL_FAILURE(Start());
   ProcessRunResult version = Run({"./curl", "-V"});
   ASSERT_TRUE(version.ran);
   EXPECT_EQ(version.exitCode, 0);
@@ -161,7 +181,7 @@ TEST_F(HostProcessTest, TransferToolIsCurlByDefault) {
 }
 
 TEST_F(HostProcessTest, MissingProgramsFailToStart) {
-  Start();
+  ASSERT_NO_FATAL_FAILURE(Start());
   for (const char* program : {"/nonexistent/tool", "no-such-program-on-path", ""}) {
     ProcessRunResult result = Run({program, "x"});
     EXPECT_FALSE(result.ran) << program;
@@ -171,7 +191,7 @@ TEST_F(HostProcessTest, MissingProgramsFailToStart) {
 }
 
 TEST_F(HostProcessTest, StartAfterCloseSendsNothing) {
-  Start();
+  ASSERT_NO_FATAL_FAILURE(Start());
   host().CloseModule();
   const size_t sent = SentMessages().size();
   EXPECT_FALSE(Run({"/bin/true"}).ran);
@@ -179,7 +199,7 @@ TEST_F(HostProcessTest, StartAfterCloseSendsNothing) {
 }
 
 TEST_F(HostProcessTest, CloseReleasesAWaitingRun) {
-  Start();
+  ASSERT_NO_FATAL_FAILURE(Start());
   auto run = RunAsync({"/bin/sh", "-c", "sleep 60"});
   ASSERT_TRUE(WaitForSent(0, 1));  // the input follows the answered start
   host().CloseModule();
@@ -192,16 +212,16 @@ TEST_F(HostProcessTest, CloseReleasesAWaitingRun) {
 }
 
 TEST_F(HostProcessTest, LoadAfterStopOpensTheServiceAgain) {
-  Start();
+  ASSERT_NO_FATAL_FAILURE(Start());
   host().Stop();
-  Start();
+  ASSERT_NO_FATAL_FAILURE(Start());
   ProcessRunResult result = Run({"/bin/sh", "-c", "exit 4"});
   EXPECT_TRUE(result.ran);
   EXPECT_EQ(result.exitCode, 4);
 }
 
 TEST_F(HostProcessTest, IdsWrapAroundToTheNextFreeOne) {
-  Start();
+  ASSERT_NO_FATAL_FAILURE(Start());
   host().Requests().Clear();
   m_setLastId(0xCFFFFF);
   auto waiting = RunAsync({"/bin/sh", "-c", "while [ ! -e release ]; do sleep 0.05; done"});
@@ -219,7 +239,7 @@ TEST_F(HostProcessTest, IdsWrapAroundToTheNextFreeOne) {
 }
 
 TEST_F(HostProcessTest, ConcurrentRunsKeepTheirOwnOutput) {
-  Start();
+  ASSERT_NO_FATAL_FAILURE(Start());
   std::vector<std::future<bool>> workers;
   for (int worker = 0; worker < 4; ++worker) {
     workers.push_back(std::async(std::launch::async, [this, worker] {
@@ -240,6 +260,52 @@ TEST_F(HostProcessTest, ConcurrentRunsKeepTheirOwnOutput) {
     }
     EXPECT_TRUE(worker.get());
   }
+}
+
+// The host's service alone, fed with requests the module would never make.
+TEST(HostProcessServiceTest, RefusesMalformedRequests) {
+  std::mutex mutex;
+  std::condition_variable arrived;
+  std::vector<std::string> delivered;
+  refhost::ProcessService service("curl", [&](const void* data, uint32_t length) {
+    std::lock_guard<std::mutex> lock(mutex);
+    delivered.emplace_back(static_cast<const char*>(data), length);
+    arrived.notify_all();
+  });
+  auto handle = [&service](std::string bytes) {
+    hx::core::HostRequest request =
+        hx::core::MakeHostRequest(hx::core::kModuleId, hx::core::kClassProcess, 0);
+    request.data = bytes.data();
+    request.length = static_cast<uint32_t>(bytes.size());
+    return service.Handle(request);
+  };
+  struct Case {
+    const char* name;
+    std::string bytes;
+    int32_t result;
+  };
+  const Case cases[] = {
+      {"shorter than a header", Message(7, 6, 2, "/bin/true").substr(0, 15), -1},
+      {"length field disagrees", Message(99, 7, 6, 2, "/bin/true"), -1},
+      {"unknown type", Message(7, 9, 2, "/bin/true"), -1},
+      {"answer type from the module", Message(7, 5, 0, ""), -1},
+      {"start without program", Message(7, 6, 2, ""), -1},
+      {"only the optional texts", Message(7, 6, 2 | 8 | 16, std::string("a\0b", 3)), -1},
+      {"longer than the maximum", Message(7, 0, 1, std::string(65521, 'x')), -1},
+      {"input for no run", Message(7, 0, 1, "x"), 0},
+  };
+  for (const Case& c : cases) EXPECT_EQ(handle(c.bytes), c.result) << c.name;
+  EXPECT_EQ(service.ActiveRuns(), 0u);
+
+  // An id is not started twice while its program runs.
+  EXPECT_EQ(handle(Message(7, 6, 2, std::string("/bin/sh\0-c\0read line", 20))), 0);
+  EXPECT_EQ(handle(Message(7, 6, 2, "/bin/true")), -1);
+  EXPECT_EQ(handle(Message(7, 0, 1, "go\n")), 0);
+  std::unique_lock<std::mutex> lock(mutex);
+  ASSERT_TRUE(arrived.wait_for(
+      lock, kRunTimeout, [&] { return !delivered.empty() && U32(delivered.back(), 8) == 5; }));
+  EXPECT_EQ(U32(delivered.front(), 8), 3u);
+  EXPECT_EQ(U32(delivered.back(), 12), 0u);
 }
 
 }  // namespace
