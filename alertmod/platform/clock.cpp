@@ -2,6 +2,8 @@
 
 #include <atomic>
 #include <ctime>
+#include <list>
+#include <mutex>
 
 namespace hx {
 namespace platform {
@@ -25,12 +27,21 @@ uint32_t SystemTickMs() {
   return static_cast<uint32_t>(ms);
 }
 
+// Replaced sources are kept for the life of the process: a reader on
+// another thread may still be calling through an old one. Tests install a
+// handful at most.
+template <typename Fn>
+const Source<Fn>* Keep(Fn fn, void* context) {
+  static std::mutex mutex;
+  static std::list<Source<Fn>> kept;
+  std::lock_guard<std::mutex> lock(mutex);
+  kept.push_back(Source<Fn>{fn, context});
+  return &kept.back();
+}
+
 template <typename Fn>
 void Install(std::atomic<const Source<Fn>*>& slot, Fn fn, void* context) {
-  // Replaced sources are leaked on purpose: a reader on another thread may
-  // still be calling through the old one. Tests install a handful at most.
-  const Source<Fn>* next = fn ? new Source<Fn>{fn, context} : nullptr;
-  slot.store(next, std::memory_order_release);
+  slot.store(fn ? Keep(fn, context) : nullptr, std::memory_order_release);
 }
 
 }  // namespace
