@@ -19,7 +19,9 @@ void* OpenSharedLibrary(const std::string& path);
 // has no such symbol or `handle` is null.
 void* FindSharedSymbol(void* handle, const char* name);
 
-// Releases a handle from OpenSharedLibrary; a null handle is ignored.
+// Releases a handle from OpenSharedLibrary; a null handle is ignored. The
+// library stays mapped for the rest of the process, so opening the same path
+// again gives the same library, even if its file has changed since.
 void CloseSharedLibrary(void* handle);
 
 }  // namespace platform

@@ -211,11 +211,7 @@ bool MultiLibWrapper::Reload() {
 }
 
 av_init::av_init(const std::string& directory) {
-  AVCodecLib::SetDirectory(directory);
-  AVFormatLib::SetDirectory(directory);
-  AVUtilLib::SetDirectory(directory);
-  AVFilterLib::SetDirectory(directory);
-  SWResampleLib::SetDirectory(directory);
+  SetLibraryDirectory(directory);
   Register(static_cast<AVCodecLib*>(this));
   Register(static_cast<AVFormatLib*>(this));
   Register(static_cast<AVUtilLib*>(this));
@@ -229,6 +225,14 @@ av_init& av_init::Instance() {
   // machine without the libraries costs nothing until a clip is wanted.
   static av_init instance;
   return instance;
+}
+
+void av_init::SetLibraryDirectory(const std::string& directory) {
+  AVCodecLib::SetDirectory(directory);
+  AVFormatLib::SetDirectory(directory);
+  AVUtilLib::SetDirectory(directory);
+  AVFilterLib::SetDirectory(directory);
+  SWResampleLib::SetDirectory(directory);
 }
 
 void av_init::AfterAllLoaded() {

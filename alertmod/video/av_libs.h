@@ -291,6 +291,9 @@ class av_init final : public MultiLibWrapper,
   // call. Lives until the module's static objects are destroyed.
   static av_init& Instance();
 
+  // Makes the next loads look in `directory` (empty: the search path).
+  void SetLibraryDirectory(const std::string& directory);
+
  private:
   void AfterAllLoaded() override;
 };

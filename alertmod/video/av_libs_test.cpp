@@ -6,7 +6,10 @@
 #include <stdlib.h>
 #include <unistd.h>
 
+#include <cstdint>
+#include <fstream>
 #include <map>
+#include <sstream>
 #include <string>
 
 #include "alertmod/video/clip_writer.h"
@@ -25,11 +28,23 @@ std::string RealPath(const char* path) {
   return realpath(path, resolved) != nullptr ? resolved : "";
 }
 
-// The file a resolved function lives in, links followed.
+// The file a resolved function is mapped from, links followed. Read from
+// the process's mappings rather than the loader, which keeps the first name
+// a library was opened under even after that name is gone.
 std::string FileOf(const void* function) {
-  Dl_info info{};
-  if (function == nullptr || dladdr(function, &info) == 0 || info.dli_fname == nullptr) return "";
-  return RealPath(info.dli_fname);
+  const auto address = reinterpret_cast<uintptr_t>(function);
+  std::ifstream maps("/proc/self/maps");
+  std::string line;
+  while (function != nullptr && std::getline(maps, line)) {
+    std::istringstream fields(line);
+    std::string range, perms, offset, device, inode, path;
+    fields >> range >> perms >> offset >> device >> inode >> path;
+    const size_t dash = range.find('-');
+    const uintptr_t begin = std::stoull(range.substr(0, dash), nullptr, 16);
+    const uintptr_t end = std::stoull(range.substr(dash + 1), nullptr, 16);
+    if (address >= begin && address < end) return path;
+  }
+  return "";
 }
 
 // A directory of links to the codec libraries the system loads, one link
@@ -126,18 +141,20 @@ TEST(CodecLibrariesTest, IncompleteSetsCountAsNotLoaded) {
 }
 
 TEST(CodecLibrariesTest, ReloadRetriesEveryLibrary) {
-  // Stand-ins only: a real library would stay mapped as a dependency of the
-  // others, and the loader would hand back that copy by name.
-  LibraryDirectory dir;
-  dir.LinkAllTo(STUB_AV_COMPLETE);
-  dir.Set("libswresample.so.4", "");
-  av_init libs(dir.path());
+  LibraryDirectory first;
+  first.LinkAllTo(STUB_AV_COMPLETE);
+  first.Set("libswresample.so.4", "");
+  av_init libs(first.path());
   ASSERT_FALSE(libs.AllLoaded());
   EXPECT_EQ(FileOf(reinterpret_cast<void*>(libs.avcodec_version)), RealPath(STUB_AV_COMPLETE));
 
-  // The codec library had loaded; a reload must open it afresh all the same.
-  dir.Set("libavcodec.so.59", STUB_AV_LACKING);
-  dir.Set("libswresample.so.4", STUB_AV_COMPLETE);
+  // A library once loaded stays mapped under its name, so the retry is seen
+  // through a second directory: the codec library had loaded, and is loaded
+  // afresh from there all the same.
+  LibraryDirectory second;
+  second.LinkAllTo(STUB_AV_COMPLETE);
+  second.Set("libavcodec.so.59", STUB_AV_LACKING);
+  libs.SetLibraryDirectory(second.path());
   EXPECT_TRUE(libs.Reload());
   EXPECT_TRUE(libs.AllLoaded());
   EXPECT_EQ(FileOf(reinterpret_cast<void*>(libs.avcodec_version)), RealPath(STUB_AV_LACKING));
@@ -210,7 +227,7 @@ TEST_F(ClipLibrariesTest, ClipAfterAFailedStartReloadsTheSet) {
   dir.Set("libswresample.so.4", "");
   av_init libs(dir.path());
   ASSERT_FALSE(libs.AllLoaded());
-  dir.Set("libswresample.so.4", dir.RealTarget("libswresample.so.4"));
+  dir.Set("libswresample.so.4", dir.RealTarget("libswresample.so.4"));  // installed since
   const std::string path = m_media.File("reloaded.mov");
   EXPECT_TRUE(WriteClip(libs, path));
   EXPECT_TRUE(libs.AllLoaded());
