@@ -69,6 +69,22 @@ constexpr uint32_t kRequestExtVersion = 1;
 constexpr uint32_t kHostRequestSize = 192;
 constexpr uint32_t kHostRequestVersion = 1;
 
+// Process-service messages (request class 0x2000 and IOCTL code 4): a
+// ProcessMessageHeader, then the payload; at most 65536 bytes in all.
+constexpr uint32_t kProcessMessageMaxBytes = 65536;
+// Message types: module to host.
+constexpr uint32_t kProcessInput = 0;  // standard input; one shorter than the maximum ends it
+constexpr uint32_t kProcessStart = 6;  // value: start flags; payload: the command
+// Message types: host to module.
+constexpr uint32_t kProcessOutput = 1;
+constexpr uint32_t kProcessErrorOutput = 2;
+constexpr uint32_t kProcessRunning = 3;
+constexpr uint32_t kProcessFailed = 4;
+constexpr uint32_t kProcessExited = 5;  // value: the exit code
+// Start flags that put optional texts before the program.
+constexpr uint32_t kProcessFlagFirstText = 8;
+constexpr uint32_t kProcessFlagSecondText = 16;
+
 // Host to module, read by Load.
 struct LoadParmsIn {
   uint8_t hostReserved0[0x10];
@@ -131,6 +147,15 @@ struct IoctlParmsIn {
   const void* data;  // 0x20
 };
 
+// Both ways: the header of a process-service message, little-endian.
+struct ProcessMessageHeader {
+  uint32_t length;  // header plus payload, in bytes
+  uint32_t id;      // the program run
+  uint32_t type;
+  uint32_t value;  // start flags, 1 for input, or the host's status
+};
+constexpr uint32_t kProcessHeaderBytes = sizeof(ProcessMessageHeader);
+
 // Module to host: every request the module makes. Zero-filled before use.
 struct HostRequest {
   uint32_t size;     // 0x00: always 192
@@ -188,6 +213,10 @@ static_assert(offsetof(HostRequest, extSize) == 0x28, "HostRequest layout");
 static_assert(offsetof(HostRequest, extVersion) == 0x2C, "HostRequest layout");
 static_assert(offsetof(HostRequest, extValue) == 0x30, "HostRequest layout");
 static_assert(sizeof(HostRequest) == kHostRequestSize, "HostRequest is 192 bytes");
+static_assert(offsetof(ProcessMessageHeader, id) == 0x04, "ProcessMessageHeader layout");
+static_assert(offsetof(ProcessMessageHeader, type) == 0x08, "ProcessMessageHeader layout");
+static_assert(offsetof(ProcessMessageHeader, value) == 0x0C, "ProcessMessageHeader layout");
+static_assert(sizeof(ProcessMessageHeader) == 16, "ProcessMessageHeader is 16 bytes");
 
 }  // namespace core
 }  // namespace hx

@@ -16,21 +16,15 @@
 extern char** environ;
 
 namespace refhost {
+
+namespace core = hx::core;
+
 namespace {
 
-constexpr size_t kMaxPayloadBytes = kProcessMessageMaxBytes - kProcessHeaderBytes;
+constexpr size_t kMaxPayloadBytes = core::kProcessMessageMaxBytes - core::kProcessHeaderBytes;
 // Reads of output left in the pipes after the program ended; bounds the
 // drain when a leftover child of the program keeps writing.
 constexpr int kMaxDrainReads = 64;
-
-uint32_t ReadU32(const char* bytes) {
-  const auto* b = reinterpret_cast<const unsigned char*>(bytes);
-  return uint32_t{b[0]} | uint32_t{b[1]} << 8 | uint32_t{b[2]} << 16 | uint32_t{b[3]} << 24;
-}
-
-void WriteU32(char* bytes, uint32_t value) {
-  for (int i = 0; i < 4; ++i) bytes[i] = static_cast<char>(value >> (8 * i));
-}
 
 void CloseFd(int& fd) {
   if (fd >= 0) close(fd);
@@ -48,8 +42,8 @@ std::vector<std::string> ParseStartCommand(uint32_t flags, const char* payload, 
       begin = i + 1;
     }
   }
-  size_t skipped =
-      ((flags & kProcessFlagFirstText) ? 1 : 0) + ((flags & kProcessFlagSecondText) ? 1 : 0);
+  size_t skipped = ((flags & core::kProcessFlagFirstText) ? 1 : 0) +
+                   ((flags & core::kProcessFlagSecondText) ? 1 : 0);
   if (words.size() <= skipped || words[skipped].empty()) return {};
   return std::vector<std::string>(words.begin() + skipped, words.end());
 }
@@ -144,21 +138,21 @@ ProcessService::~ProcessService() {
   Stop();
 }
 
-int32_t ProcessService::Handle(hx::core::HostRequest& request) {
-  if (request.data == nullptr || request.length < kProcessHeaderBytes ||
-      request.length > kProcessMessageMaxBytes) {
+int32_t ProcessService::Handle(core::HostRequest& request) {
+  if (request.data == nullptr || request.length < core::kProcessHeaderBytes ||
+      request.length > core::kProcessMessageMaxBytes) {
     return -1;
   }
-  const char* bytes = static_cast<const char*>(request.data);
-  if (ReadU32(bytes) != request.length) return -1;
-  uint32_t id = ReadU32(bytes + 4);
-  uint32_t type = ReadU32(bytes + 8);
-  uint32_t value = ReadU32(bytes + 12);
-  const char* payload = bytes + kProcessHeaderBytes;
-  size_t payloadLength = request.length - kProcessHeaderBytes;
-  if (type == kProcessStart) return Start(id, value, payload, payloadLength);
-  if (type == kProcessInput) {
-    return Input(id, payload, payloadLength, request.length < kProcessMessageMaxBytes);
+  core::ProcessMessageHeader header;
+  memcpy(&header, request.data, sizeof(header));
+  if (header.length != request.length) return -1;
+  const char* payload = static_cast<const char*>(request.data) + core::kProcessHeaderBytes;
+  size_t payloadLength = request.length - core::kProcessHeaderBytes;
+  if (header.type == core::kProcessStart) {
+    return Start(header.id, header.value, payload, payloadLength);
+  }
+  if (header.type == core::kProcessInput) {
+    return Input(header.id, payload, payloadLength, request.length < core::kProcessMessageMaxBytes);
   }
   return -1;
 }
@@ -269,8 +263,8 @@ void ProcessService::PumpUntilExit(Run& run) {
       (void)ignored;
     }
     FeedInput(run);
-    if (fds[2].revents != 0) ForwardOutput(run, run.stdoutFd, kProcessOutput);
-    if (fds[3].revents != 0) ForwardOutput(run, run.stderrFd, kProcessErrorOutput);
+    if (fds[2].revents != 0) ForwardOutput(run, run.stdoutFd, core::kProcessOutput);
+    if (fds[3].revents != 0) ForwardOutput(run, run.stderrFd, core::kProcessErrorOutput);
     if (fds[0].revents != 0) return;
     if (run.pidFd < 0 && run.stdoutFd < 0 && run.stderrFd < 0) return;
   }
@@ -278,14 +272,14 @@ void ProcessService::PumpUntilExit(Run& run) {
 
 void ProcessService::Pump(const std::shared_ptr<Run>& run) {
   if (run->spawnError != 0) {
-    Finish(run, kProcessFailed, run->spawnError);
+    Finish(run, core::kProcessFailed, run->spawnError);
     return;
   }
   BlockBrokenPipeSignal();
   SetNonBlocking(run->stdinFd);
   SetNonBlocking(run->stdoutFd);
   SetNonBlocking(run->stderrFd);
-  Deliver(run->id, kProcessRunning, run->pid, nullptr, 0);
+  Deliver(run->id, core::kProcessRunning, run->pid, nullptr, 0);
   PumpUntilExit(*run);
   // Children the program left behind would keep its pipes open and outlive
   // the run. The program itself is not reaped yet, so its group id cannot
@@ -293,10 +287,10 @@ void ProcessService::Pump(const std::shared_ptr<Run>& run) {
   if (run->pidFd >= 0) kill(-run->pid, SIGKILL);
   // The program's last output is still in the pipes.
   for (int i = 0; i < kMaxDrainReads && run->stdoutFd >= 0; ++i) {
-    if (!ForwardOutput(*run, run->stdoutFd, kProcessOutput)) break;
+    if (!ForwardOutput(*run, run->stdoutFd, core::kProcessOutput)) break;
   }
   for (int i = 0; i < kMaxDrainReads && run->stderrFd >= 0; ++i) {
-    if (!ForwardOutput(*run, run->stderrFd, kProcessErrorOutput)) break;
+    if (!ForwardOutput(*run, run->stderrFd, core::kProcessErrorOutput)) break;
   }
   int status = 0;
   {
@@ -306,7 +300,7 @@ void ProcessService::Pump(const std::shared_ptr<Run>& run) {
     run->reaped = true;
     CloseFd(run->stdinFd);
   }
-  Finish(run, kProcessExited, ExitValue(status));
+  Finish(run, core::kProcessExited, ExitValue(status));
 }
 
 void ProcessService::Finish(const std::shared_ptr<Run>& run, uint32_t type, int32_t value) {
@@ -324,12 +318,11 @@ void ProcessService::Finish(const std::shared_ptr<Run>& run, uint32_t type, int3
 void ProcessService::Deliver(uint32_t id, uint32_t type, int32_t value, const char* payload,
                              size_t length) {
   if (m_stopping.load()) return;
-  std::vector<char> message(kProcessHeaderBytes + length);
-  WriteU32(message.data(), static_cast<uint32_t>(message.size()));
-  WriteU32(message.data() + 4, id);
-  WriteU32(message.data() + 8, type);
-  WriteU32(message.data() + 12, static_cast<uint32_t>(value));
-  if (length > 0) memcpy(message.data() + kProcessHeaderBytes, payload, length);
+  std::vector<char> message(core::kProcessHeaderBytes + length);
+  const core::ProcessMessageHeader header{static_cast<uint32_t>(message.size()), id, type,
+                                          static_cast<uint32_t>(value)};
+  memcpy(message.data(), &header, sizeof(header));
+  if (length > 0) memcpy(message.data() + core::kProcessHeaderBytes, payload, length);
   m_deliver(message.data(), static_cast<uint32_t>(message.size()));
 }
 

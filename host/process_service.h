@@ -31,20 +31,6 @@
 
 namespace refhost {
 
-// Process message layout and types, as both sides use them.
-constexpr uint32_t kProcessHeaderBytes = 16;
-constexpr uint32_t kProcessMessageMaxBytes = 65536;
-constexpr uint32_t kProcessInput = 0;
-constexpr uint32_t kProcessOutput = 1;
-constexpr uint32_t kProcessErrorOutput = 2;
-constexpr uint32_t kProcessRunning = 3;
-constexpr uint32_t kProcessFailed = 4;
-constexpr uint32_t kProcessExited = 5;
-constexpr uint32_t kProcessStart = 6;
-// Start flags that put optional texts before the program.
-constexpr uint32_t kProcessFlagFirstText = 8;
-constexpr uint32_t kProcessFlagSecondText = 16;
-
 // The program name that stands for the transfer tool.
 constexpr char kTransferToolName[] = "./curl";
 

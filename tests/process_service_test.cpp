@@ -1,9 +1,11 @@
 #include <gtest/gtest.h>
 #include <sys/wait.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <chrono>
 #include <condition_variable>
+#include <cstring>
 #include <future>
 #include <mutex>
 #include <string>
@@ -20,29 +22,23 @@ using testsupport::ReadFile;
 
 constexpr auto kRunTimeout = std::chrono::seconds(30);
 
-uint32_t U32(const std::string& bytes, size_t offset) {
-  uint32_t value = 0;
-  for (int i = 3; i >= 0; --i) value = value << 8 | static_cast<unsigned char>(bytes[offset + i]);
-  return value;
+using hx::core::ProcessMessageHeader;
+
+ProcessMessageHeader HeaderOf(const std::string& message) {
+  ProcessMessageHeader header{};
+  memcpy(&header, message.data(), std::min(message.size(), sizeof(header)));
+  return header;
 }
 
 std::string Message(uint32_t length, uint32_t id, uint32_t type, uint32_t value,
                     const std::string& payload) {
-  std::string message(16, '\0');
-  const uint32_t fields[4] = {length, id, type, value};
-  for (int f = 0; f < 4; ++f) {
-    for (int i = 0; i < 4; ++i) message[f * 4 + i] = static_cast<char>(fields[f] >> (8 * i));
-  }
-  return message + payload;
+  const ProcessMessageHeader header{length, id, type, value};
+  return std::string(reinterpret_cast<const char*>(&header), sizeof(header)) + payload;
 }
 
 std::string Message(uint32_t id, uint32_t type, uint32_t value, const std::string& payload) {
   return Message(static_cast<uint32_t>(16 + payload.size()), id, type, value, payload);
 }
-
-struct SentMessage {
-  uint32_t length, id, type;
-};
 
 class HostProcessTest : public testsupport::ModuleHostTest {
  protected:
@@ -77,10 +73,10 @@ class HostProcessTest : public testsupport::ModuleHostTest {
     return run.get();
   }
 
-  std::vector<SentMessage> SentMessages() {
-    std::vector<SentMessage> messages;
+  std::vector<ProcessMessageHeader> SentMessages() {
+    std::vector<ProcessMessageHeader> messages;
     for (const auto& request : host().Requests().OfClass(hx::core::kClassProcess)) {
-      messages.push_back({U32(request.bytes, 0), U32(request.bytes, 4), U32(request.bytes, 8)});
+      messages.push_back(HeaderOf(request.bytes));
     }
     return messages;
   }
@@ -91,8 +87,8 @@ class HostProcessTest : public testsupport::ModuleHostTest {
         [&](const std::vector<refhost::RecordedRequest>& requests) {
           size_t seen = 0;
           for (const auto& request : requests) {
-            if (request.requestClass == hx::core::kClassProcess && request.bytes.size() >= 16 &&
-                U32(request.bytes, 8) == type) {
+            if (request.requestClass == hx::core::kClassProcess &&
+                HeaderOf(request.bytes).type == type) {
               ++seen;
             }
           }
@@ -153,7 +149,7 @@ TEST_F(HostProcessTest, LargeInputArrivesWhole) {
     EXPECT_EQ(result.exitCode, 0);
     EXPECT_EQ(ReadFile(dir().File("got.bin")), input) << length;
     std::vector<uint32_t> inputLengths;
-    for (const SentMessage& message : SentMessages()) {
+    for (const ProcessMessageHeader& message : SentMessages()) {
       if (message.type == 0) inputLengths.push_back(message.length);
     }
     std::vector<uint32_t> expected = length == 70000 ? std::vector<uint32_t>{65536, 4496}
@@ -232,7 +228,7 @@ TEST_F(HostProcessTest, IdsWrapAroundToTheNextFreeOne) {
   EXPECT_TRUE(Await(waiting).ran);
 
   std::vector<uint32_t> startIds;
-  for (const SentMessage& message : SentMessages()) {
+  for (const ProcessMessageHeader& message : SentMessages()) {
     if (message.type == 6) startIds.push_back(message.id);
   }
   EXPECT_EQ(startIds, (std::vector<uint32_t>{0xC00000, 0xC00001}));
@@ -302,10 +298,11 @@ TEST(HostProcessServiceTest, RefusesMalformedRequests) {
   EXPECT_EQ(handle(Message(7, 6, 2, "/bin/true")), -1);
   EXPECT_EQ(handle(Message(7, 0, 1, "go\n")), 0);
   std::unique_lock<std::mutex> lock(mutex);
-  ASSERT_TRUE(arrived.wait_for(
-      lock, kRunTimeout, [&] { return !delivered.empty() && U32(delivered.back(), 8) == 5; }));
-  EXPECT_EQ(U32(delivered.front(), 8), 3u);
-  EXPECT_EQ(U32(delivered.back(), 12), 0u);
+  ASSERT_TRUE(arrived.wait_for(lock, kRunTimeout, [&] {
+    return !delivered.empty() && HeaderOf(delivered.back()).type == 5;
+  }));
+  EXPECT_EQ(HeaderOf(delivered.front()).type, 3u);
+  EXPECT_EQ(HeaderOf(delivered.back()).value, 0u);
 }
 
 }  // namespace

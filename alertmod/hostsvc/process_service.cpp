@@ -35,23 +35,14 @@ class ProcessRegistry final {
 // Every value of the counter is tried once before a start gives up.
 constexpr uint32_t kCounterAttempts = kIdCounterMask + 1;
 
-uint32_t ReadU32(const unsigned char* bytes) {
-  return uint32_t{bytes[0]} | uint32_t{bytes[1]} << 8 | uint32_t{bytes[2]} << 16 |
-         uint32_t{bytes[3]} << 24;
-}
-
-void WriteU32(unsigned char* bytes, uint32_t value) {
-  for (int i = 0; i < 4; ++i) bytes[i] = static_cast<unsigned char>(value >> (8 * i));
-}
+constexpr size_t kMaxPayloadBytes = core::kProcessMessageMaxBytes - core::kProcessHeaderBytes;
 
 bool SendOne(SendFunction send, uint32_t id, uint32_t type, uint32_t value, const char* payload,
              size_t length, std::vector<unsigned char>& message) {
-  message.resize(kMessageHeaderBytes + length);
-  WriteU32(message.data(), static_cast<uint32_t>(message.size()));
-  WriteU32(message.data() + 4, id);
-  WriteU32(message.data() + 8, type);
-  WriteU32(message.data() + 12, value);
-  if (length > 0) memcpy(message.data() + kMessageHeaderBytes, payload, length);
+  message.resize(core::kProcessHeaderBytes + length);
+  const core::ProcessMessageHeader header{static_cast<uint32_t>(message.size()), id, type, value};
+  memcpy(message.data(), &header, sizeof(header));
+  if (length > 0) memcpy(message.data() + core::kProcessHeaderBytes, payload, length);
   return send(message.data(), message.size());
 }
 
@@ -71,8 +62,10 @@ bool EndsInPs1(const std::string& program) {
 
 std::string BuildStartPayload(const ProcessOptions& options) {
   std::string payload;
-  if (options.flags & kFlagFirstText) payload.append(options.firstText).push_back('\0');
-  if (options.flags & kFlagSecondText) payload.append(options.secondText).push_back('\0');
+  if (options.flags & core::kProcessFlagFirstText)
+    payload.append(options.firstText).push_back('\0');
+  if (options.flags & core::kProcessFlagSecondText)
+    payload.append(options.secondText).push_back('\0');
   for (size_t i = 0; i < options.arguments.size(); ++i) {
     if (i > 0) payload.push_back('\0');
     payload.append(options.arguments[i]);
@@ -126,36 +119,35 @@ void ShutdownProcessService(bool closed) {
 }
 
 int OnProcessMessage(const void* data, uint64_t length) {
-  if (data == nullptr || length < kMessageHeaderBytes) return 0;
-  const auto* bytes = static_cast<const unsigned char*>(data);
-  const uint32_t id = ReadU32(bytes + 4);
-  const uint32_t type = ReadU32(bytes + 8);
-  const int32_t value = static_cast<int32_t>(ReadU32(bytes + 12));
-  const char* payload = reinterpret_cast<const char*>(bytes + kMessageHeaderBytes);
-  const size_t payloadLength = static_cast<size_t>(length - kMessageHeaderBytes);
-  if (type < kMessageOutput || type > kMessageExited) return 0;
+  if (data == nullptr || length < core::kProcessHeaderBytes) return 0;
+  core::ProcessMessageHeader header;
+  memcpy(&header, data, sizeof(header));
+  const int32_t value = static_cast<int32_t>(header.value);
+  const char* payload = static_cast<const char*>(data) + core::kProcessHeaderBytes;
+  const size_t payloadLength = static_cast<size_t>(length - core::kProcessHeaderBytes);
+  if (header.type < core::kProcessOutput || header.type > core::kProcessExited) return 0;
 
   ProcessRegistry& registry = ProcessRegistry::Instance();
   std::lock_guard<std::mutex> lock(registry.lock);
-  auto found = registry.clients.find(id);
+  auto found = registry.clients.find(header.id);
   if (found == registry.clients.end()) return 0;
   std::shared_ptr<client> process = found->second;
   {
     std::lock_guard<std::mutex> clientLock(process->lock);
-    switch (type) {
-      case kMessageOutput:
+    switch (header.type) {
+      case core::kProcessOutput:
         AppendOutput(process->standardOutput, payload, payloadLength);
         break;
-      case kMessageErrorOutput:
+      case core::kProcessErrorOutput:
         AppendOutput(process->standardError, payload, payloadLength);
         break;
-      case kMessageRunning:
+      case core::kProcessRunning:
         process->value = value;
         process->state = kStateRunning;
         break;
       default:  // failed or exited: the id is free again
         process->value = value;
-        process->state = type == kMessageFailed ? kStateFailed : kStateExited;
+        process->state = header.type == core::kProcessFailed ? kStateFailed : kStateExited;
         registry.clients.erase(found);
         break;
     }
@@ -168,12 +160,12 @@ bool SendProcessMessage(uint32_t id, uint32_t type, uint32_t value, const void* 
                         size_t length) {
   SendFunction send = ProcessRegistry::Instance().send.load();
   if (send == nullptr || (data == nullptr && length > 0)) return false;
-  if (type != kMessageInput && length > kMessageMaxPayloadBytes) return false;
+  if (type != core::kProcessInput && length > kMaxPayloadBytes) return false;
   const char* bytes = static_cast<const char*>(data);
   std::vector<unsigned char> message;
   size_t offset = 0;
   do {
-    size_t piece = std::min(length - offset, kMessageMaxPayloadBytes);
+    size_t piece = std::min(length - offset, kMaxPayloadBytes);
     if (!SendOne(send, id, type, value, bytes + offset, piece, message)) return false;
     offset += piece;
   } while (offset < length);
@@ -201,7 +193,8 @@ std::shared_ptr<client> StartProcess(const ProcessOptions& options) {
       return process;
     }
     process->id = id;
-    if (!SendProcessMessage(id, kMessageStart, options.flags, payload.data(), payload.size())) {
+    if (!SendProcessMessage(id, core::kProcessStart, options.flags, payload.data(),
+                            payload.size())) {
       SetState(*process, kStateFailed);
       return process;
     }
@@ -240,7 +233,7 @@ void WaitForExit(client& process) {
     // Sent without the client's lock: the host may be delivering output for
     // this client meanwhile, which needs it.
     lock.unlock();
-    SendProcessMessage(process.id, kMessageInput, 1, nullptr, 0);
+    SendProcessMessage(process.id, core::kProcessInput, 1, nullptr, 0);
     lock.lock();
   }
   process.condition.wait(lock, [&] { return process.state != kStateRunning; });
@@ -256,11 +249,11 @@ bool RunProcess(const std::vector<std::string>& arguments, const std::string& in
     if (process->state == kStateFailed) return false;
     process->endInputAtWait = false;
   }
-  SendProcessMessage(process->id, kMessageInput, 1, input.data(), input.size());
+  SendProcessMessage(process->id, core::kProcessInput, 1, input.data(), input.size());
   // The host ends the program's input at a message shorter than the
   // maximum; input filling whole messages needs one more, empty.
-  if (!input.empty() && input.size() % kMessageMaxPayloadBytes == 0) {
-    SendProcessMessage(process->id, kMessageInput, 1, nullptr, 0);
+  if (!input.empty() && input.size() % kMaxPayloadBytes == 0) {
+    SendProcessMessage(process->id, core::kProcessInput, 1, nullptr, 0);
   }
   std::string line;
   while (ReadOutputLine(*process, line, 1)) errorLines.push_back(line);

@@ -20,6 +20,8 @@
 #include <string>
 #include <vector>
 
+#include "alertmod/host_records.h"
+
 namespace hx {
 namespace ipc {
 
@@ -32,23 +34,9 @@ constexpr int32_t kStateRunning = 1;
 constexpr int32_t kStateExited = 2;
 constexpr int32_t kStateFailed = -1;
 
-// Message layout and types.
-constexpr size_t kMessageHeaderBytes = 16;
-constexpr size_t kMessageMaxBytes = 65536;
-constexpr size_t kMessageMaxPayloadBytes = kMessageMaxBytes - kMessageHeaderBytes;
-constexpr uint32_t kMessageInput = 0;        // module to host: standard input
-constexpr uint32_t kMessageOutput = 1;       // host to module: standard output
-constexpr uint32_t kMessageErrorOutput = 2;  // host to module: standard error
-constexpr uint32_t kMessageRunning = 3;
-constexpr uint32_t kMessageFailed = 4;
-constexpr uint32_t kMessageExited = 5;
-constexpr uint32_t kMessageStart = 6;
-
-// Start flags.
+// Start flags; 8 and 16 (texts before the program) are in host_records.h.
 constexpr uint32_t kFlagsDefault = 2;
 constexpr uint32_t kFlagKeepInputAtWait = 4;  // no empty input at wait for ".ps1"
-constexpr uint32_t kFlagFirstText = 8;
-constexpr uint32_t kFlagSecondText = 16;
 
 // Ids are the module id shifted left by 4 bits, OR a 20-bit counter.
 constexpr uint32_t kIdCounterMask = 0xFFFFF;

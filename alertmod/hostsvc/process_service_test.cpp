@@ -2,8 +2,10 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <chrono>
 #include <condition_variable>
+#include <cstring>
 #include <future>
 #include <mutex>
 #include <string>
@@ -16,28 +18,18 @@ namespace {
 constexpr uint32_t kModuleId = 0xC0000;
 constexpr auto kWait = std::chrono::seconds(20);
 
-struct Header {
-  uint32_t length, id, type, value;
-};
+using core::ProcessMessageHeader;
 
-uint32_t U32(const std::string& bytes, size_t offset) {
-  uint32_t value = 0;
-  for (int i = 3; i >= 0; --i) value = value << 8 | static_cast<unsigned char>(bytes[offset + i]);
-  return value;
-}
-
-Header HeaderOf(const std::string& message) {
-  return {U32(message, 0), U32(message, 4), U32(message, 8), U32(message, 12)};
+ProcessMessageHeader HeaderOf(const std::string& message) {
+  ProcessMessageHeader header{};
+  memcpy(&header, message.data(), std::min(message.size(), sizeof(header)));
+  return header;
 }
 
 std::string Message(uint32_t id, uint32_t type, int32_t value, const std::string& payload = "") {
-  std::string message(16, '\0');
-  uint32_t fields[4] = {static_cast<uint32_t>(16 + payload.size()), id, type,
-                        static_cast<uint32_t>(value)};
-  for (int f = 0; f < 4; ++f) {
-    for (int i = 0; i < 4; ++i) message[f * 4 + i] = static_cast<char>(fields[f] >> (8 * i));
-  }
-  return message + payload;
+  const ProcessMessageHeader header{static_cast<uint32_t>(16 + payload.size()), id, type,
+                                    static_cast<uint32_t>(value)};
+  return std::string(reinterpret_cast<const char*>(&header), sizeof(header)) + payload;
 }
 
 ProcessOptions Opts(std::vector<std::string> arguments, uint32_t flags = kFlagsDefault,
