@@ -122,13 +122,13 @@ struct ProcessService::Run {
   int wakeFd = -1;  // signalled when input arrives
   int stdoutFd = -1;
   int stderrFd = -1;
+  std::thread thread;
+  std::atomic<bool> done{false};
   std::mutex mutex;  // guards the fields below
   int stdinFd = -1;
   std::string input;  // taken from the module, not yet written to the program
   bool inputEnded = false;
   bool reaped = false;
-  std::thread thread;
-  std::atomic<bool> done{false};
 };
 
 ProcessService::ProcessService(std::string transferTool, DeliverFn deliver)
@@ -166,24 +166,31 @@ int32_t ProcessService::Start(uint32_t id, uint32_t flags, const char* payload, 
   std::lock_guard<std::mutex> lock(m_mutex);
   if (m_stopping.load() || m_running.count(id) != 0) return -1;
   auto run = std::make_shared<Run>(id);
-  int pipes[3][2] = {{-1, -1}, {-1, -1}, {-1, -1}};
-  for (auto& pipe : pipes) {
-    if (pipe2(pipe, O_CLOEXEC) != 0 && run->spawnError == 0) run->spawnError = errno;
-  }
-  const int childFds[3] = {pipes[0][0], pipes[1][1], pipes[2][1]};
-  if (run->spawnError == 0) run->spawnError = Spawn(arguments, childFds, run->pid);
-  for (int i = 0; i < 3; ++i) CloseFd(pipes[i][i == 0 ? 0 : 1]);
-  run->stdinFd = pipes[0][1];
-  run->stdoutFd = pipes[1][0];
-  run->stderrFd = pipes[2][0];
-  if (run->spawnError == 0) {
-    run->pidFd = static_cast<int>(syscall(SYS_pidfd_open, run->pid, 0));
-    run->wakeFd = eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
-    m_running[id] = run;
-  }
+  Launch(*run, arguments);
+  if (run->spawnError == 0) m_running[id] = run;
   m_runs.push_back(run);
   run->thread = std::thread([this, run] { Pump(run); });
   return 0;
+}
+
+void ProcessService::Launch(Run& run, std::vector<std::string>& arguments) {
+  int pipes[3][2] = {{-1, -1}, {-1, -1}, {-1, -1}};
+  for (auto& pipe : pipes) {
+    if (pipe2(pipe, O_CLOEXEC) != 0 && run.spawnError == 0) run.spawnError = errno;
+  }
+  run.wakeFd = eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
+  if (run.wakeFd < 0 && run.spawnError == 0) run.spawnError = errno;
+  const int childFds[3] = {pipes[0][0], pipes[1][1], pipes[2][1]};
+  if (run.spawnError == 0) run.spawnError = Spawn(arguments, childFds, run.pid);
+  // The program has its own copies of its ends.
+  CloseFd(pipes[0][0]);
+  CloseFd(pipes[1][1]);
+  CloseFd(pipes[2][1]);
+  run.stdinFd = pipes[0][1];
+  run.stdoutFd = pipes[1][0];
+  run.stderrFd = pipes[2][0];
+  // Without a process descriptor the run ends when both outputs close.
+  if (run.spawnError == 0) run.pidFd = static_cast<int>(syscall(SYS_pidfd_open, run.pid, 0));
 }
 
 int32_t ProcessService::Input(uint32_t id, const char* payload, size_t length, bool last) {
@@ -206,30 +213,25 @@ int32_t ProcessService::Input(uint32_t id, const char* payload, size_t length, b
   return 0;
 }
 
-namespace {
-
-// Writes what the pipe takes of the run's pending input; closes the
-// program's input once the module ended it, or when the program stopped
-// reading (its pending input is then dropped).
-template <typename RunT>
-void FeedInput(RunT& run) {
+void ProcessService::FeedInput(Run& run) {
   std::lock_guard<std::mutex> lock(run.mutex);
   while (!run.input.empty() && run.stdinFd >= 0) {
     ssize_t n = write(run.stdinFd, run.input.data(), run.input.size());
     if (n > 0) {
       run.input.erase(0, static_cast<size_t>(n));
+    } else if (n < 0 && errno == EINTR) {
+      continue;
     } else if (n < 0 && errno == EAGAIN) {
       return;
-    } else if (n < 0 && errno != EINTR) {
-      if (errno == EPIPE) DiscardBrokenPipeSignal();
+    } else {
+      // The program stopped reading: what it did not take is dropped.
+      if (n < 0 && errno == EPIPE) DiscardBrokenPipeSignal();
       CloseFd(run.stdinFd);
       run.input.clear();
     }
   }
   if (run.input.empty() && run.inputEnded) CloseFd(run.stdinFd);
 }
-
-}  // namespace
 
 bool ProcessService::ForwardOutput(Run& run, int& fd, uint32_t type) {
   char buffer[kMaxPayloadBytes];
@@ -246,16 +248,16 @@ bool ProcessService::ForwardOutput(Run& run, int& fd, uint32_t type) {
 // Without a process descriptor the end is seen when both outputs close.
 void ProcessService::PumpUntilExit(Run& run) {
   for (;;) {
-    bool wantsOutput;
+    bool inputPending;
     {
       std::lock_guard<std::mutex> lock(run.mutex);
-      wantsOutput = !run.input.empty() && run.stdinFd >= 0;
+      inputPending = !run.input.empty() && run.stdinFd >= 0;
     }
     pollfd fds[5] = {{run.pidFd, POLLIN, 0},
                      {run.wakeFd, POLLIN, 0},
                      {run.stdoutFd, POLLIN, 0},
                      {run.stderrFd, POLLIN, 0},
-                     {wantsOutput ? run.stdinFd : -1, POLLOUT, 0}};
+                     {inputPending ? run.stdinFd : -1, POLLOUT, 0}};
     if (poll(fds, 5, -1) < 0 && errno != EINTR) return;
     if (fds[1].revents != 0) {
       uint64_t count = 0;

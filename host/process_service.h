@@ -65,7 +65,12 @@ class ProcessService {
 
   int32_t Start(uint32_t id, uint32_t flags, const char* payload, size_t length);
   int32_t Input(uint32_t id, const char* payload, size_t length, bool last);
+  // Creates the pipes and spawns the program; failures go to spawnError.
+  void Launch(Run& run, std::vector<std::string>& arguments);
   void Pump(const std::shared_ptr<Run>& run);
+  // Writes what the pipe takes of the pending input; closes the program's
+  // input once the module ended it or the program stopped reading.
+  void FeedInput(Run& run);
   void PumpUntilExit(Run& run);
   // Forwards one read of `fd`; false at its end or when nothing was there.
   bool ForwardOutput(Run& run, int& fd, uint32_t type);

@@ -6,6 +6,7 @@
 #include <chrono>
 #include <condition_variable>
 #include <cstring>
+#include <filesystem>
 #include <future>
 #include <mutex>
 #include <string>
@@ -202,6 +203,27 @@ TEST_F(HostProcessTest, CloseReleasesAWaitingRun) {
   EXPECT_FALSE(Await(run).ran);
   // Stopping the host ends the program and reaps it.
   host().Stop();
+  errno = 0;
+  EXPECT_EQ(waitpid(-1, nullptr, WNOHANG), -1);
+  EXPECT_EQ(errno, ECHILD);
+}
+
+size_t OpenDescriptors() {
+  size_t count = 0;
+  for (const auto& entry : std::filesystem::directory_iterator("/proc/self/fd")) {
+    (void)entry;
+    ++count;
+  }
+  return count;
+}
+
+TEST_F(HostProcessTest, RunsLeaveNoDescriptorsOrProcessesBehind) {
+  const size_t before = OpenDescriptors();
+  ASSERT_NO_FATAL_FAILURE(Start());
+  for (int i = 0; i < 10; ++i) EXPECT_TRUE(Run({"/bin/sh", "-c", "echo x >&2"}, "in").ran);
+  EXPECT_FALSE(Run({"/nonexistent/tool"}).ran);
+  host().Stop();
+  EXPECT_EQ(OpenDescriptors(), before);
   errno = 0;
   EXPECT_EQ(waitpid(-1, nullptr, WNOHANG), -1);
   EXPECT_EQ(errno, ECHILD);
