@@ -4,11 +4,15 @@
 // promises the frame intake and the stream links rely on.
 #include <tinyxml.h>
 
+#include <algorithm>
 #include <cstddef>
 #include <cstdint>
 #include <set>
 #include <string>
+#include <utility>
+#include <vector>
 
+#include "alertmod/config/xml_document.h"
 #include "alertmod/manager/catalogue.h"
 #include "alertmod/manager/event_source_key.h"
 
@@ -62,6 +66,40 @@ void CheckTables(const hx::HostSystemCatalogue& catalogue) {
   }
 }
 
+// The element depth of a tree, walked without recursion.
+size_t TreeDepth(const TiXmlNode& top) {
+  size_t deepest = 0;
+  std::vector<std::pair<const TiXmlElement*, size_t>> open;
+  for (const TiXmlElement* root = top.FirstChildElement(); root != nullptr;
+       root = root->NextSiblingElement()) {
+    open.emplace_back(root, 1);
+  }
+  while (!open.empty()) {
+    const auto [element, depth] = open.back();
+    open.pop_back();
+    deepest = std::max(deepest, depth);
+    for (const TiXmlElement* child = element->FirstChildElement(); child != nullptr;
+         child = child->NextSiblingElement()) {
+      open.emplace_back(child, depth + 1);
+    }
+  }
+  return deepest;
+}
+
+// The nesting guard must never count less than TinyXML builds, also for
+// texts that TinyXML gives up on half way.
+void CheckNestingGuard(const std::string& text) {
+  const std::optional<size_t> walked = hx::XmlNestingDepth(text, hx::kMaxXmlNesting);
+  if (!walked || *walked > hx::kMaxXmlNesting) {
+    return;
+  }
+  std::string padded(text.c_str());
+  padded.append(8, '\0');
+  TiXmlDocument raw;
+  raw.Parse(padded.c_str(), nullptr, TIXML_ENCODING_LEGACY);
+  Check(TreeDepth(raw) <= *walked);
+}
+
 void AskEverything(const hx::HostSystemCatalogue& catalogue) {
   for (const uint32_t key : KeysOf(catalogue)) {
     for (int32_t type = kFirstType; type <= kLastType; ++type) {
@@ -79,12 +117,14 @@ void AskEverything(const hx::HostSystemCatalogue& catalogue) {
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   const std::string text(reinterpret_cast<const char*>(data), size);
+  if (text.compare(0, 3, "\xEF\xBB\xBF") != 0) {
+    CheckNestingGuard(text);
+  }
   TiXmlDocument document;
-  document.Parse(text.c_str());
-  const TiXmlElement* root = document.RootElement();
-  if (document.Error() || root == nullptr) {
+  if (!hx::ParseXmlDocument(text, document) || document.RootElement() == nullptr) {
     return 0;
   }
+  const TiXmlElement* root = document.RootElement();
   hx::HostSystemCatalogue catalogue;
   catalogue.RebuildCatalogue(*root);
   catalogue.RebuildCatalogue(*root);
