@@ -41,6 +41,8 @@ const char kUsage[] =
     "  --seconds N        how long to run (default 5)\n"
     "  --log-level N      host log threshold: 25 info, 50 warning, 75 error (default 25)\n"
     "  --log-file PATH    write the host log to PATH instead of standard error\n"
+    "  --transfer-tool P  the program that \"./curl\" runs (default: curl on PATH)\n"
+    "  --host-key PATH    the password key file (default: hostkey.bin)\n"
     "  --update FILE      after Open, send FILE as a configuration update (a Notify\n"
     "                     element, or a whole Trellan document)\n"
     "  --show-config      print the configuration the module posted last, passwords\n"
@@ -90,6 +92,10 @@ CommandLine Parse(int argc, char** argv) {
       cl.host.modulePath = argv[++i];
     } else if (arg == "--log-file" && value) {
       cl.host.logFile = argv[++i];
+    } else if (arg == "--transfer-tool" && value) {
+      cl.host.transferTool = argv[++i];
+    } else if (arg == "--host-key" && value) {
+      cl.host.hostKeyFile = argv[++i];
     } else if (arg == "--update" && value) {
       cl.updateFile = argv[++i];
     } else if (arg == "--feed" && value && ParseFeed(value, &cl.feeds)) {

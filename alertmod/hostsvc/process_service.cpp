@@ -62,10 +62,12 @@ bool EndsInPs1(const std::string& program) {
 
 std::string BuildStartPayload(const ProcessOptions& options) {
   std::string payload;
-  if (options.flags & core::kProcessFlagFirstText)
+  if (options.flags & core::kProcessFlagFirstText) {
     payload.append(options.firstText).push_back('\0');
-  if (options.flags & core::kProcessFlagSecondText)
+  }
+  if (options.flags & core::kProcessFlagSecondText) {
     payload.append(options.secondText).push_back('\0');
+  }
   for (size_t i = 0; i < options.arguments.size(); ++i) {
     if (i > 0) payload.push_back('\0');
     payload.append(options.arguments[i]);
