@@ -70,17 +70,22 @@ void GopBuffer::DropFront() {
 }
 
 void GopBuffer::PushFront(Gop gop) {
-  const uint64_t bytes = gop.bytes;
-  const uint64_t frames = gop.frames.size();
-  m_gops.push_front(std::move(gop));
-  m_bytes += bytes;
-  m_frames += frames;
+  Insert(std::move(gop), true);
 }
 
 void GopBuffer::PushBack(Gop gop) {
+  Insert(std::move(gop), false);
+}
+
+void GopBuffer::Insert(Gop gop, bool atFront) {
   const uint64_t bytes = gop.bytes;
   const uint64_t frames = gop.frames.size();
-  m_gops.push_back(std::move(gop));
+  // Counted only once the GOP is in, so that a failed insert changes nothing.
+  if (atFront) {
+    m_gops.push_front(std::move(gop));
+  } else {
+    m_gops.push_back(std::move(gop));
+  }
   m_bytes += bytes;
   m_frames += frames;
 }

@@ -96,6 +96,7 @@ class GopBuffer {
   void TrimStills();
   bool MakeRoom(uint64_t size, bool key);
   void OpenGop(const VideoFrame& frame);
+  void Insert(Gop gop, bool atFront);
 
   StreamFormat m_format;
   uint64_t m_maxBytes;
