@@ -84,11 +84,4 @@ TEST(GopBufferTest, JpegHistoryHoldsTheNewestTwentyStills) {
   EXPECT_EQ(25u, video.Gops().size());
 }
 
-TEST(GopBufferTest, SpanIsTakenAcrossTheTickWrap) {
-  hx::GopBuffer buffer(Format(hx::kCodecH264), 1u << 20);
-  ASSERT_TRUE(buffer.Push(LooseFrame(0xFFFFFF00u, true, 1)));
-  ASSERT_TRUE(buffer.Push(LooseFrame(0x00000100u, false, 1)));
-  EXPECT_EQ(0x200u, buffer.SpanMs());
-}
-
 }  // namespace

@@ -3,7 +3,6 @@
 #include <gtest/gtest.h>
 
 #include <memory>
-#include <optional>
 #include <string>
 #include <vector>
 
@@ -42,36 +41,6 @@ TEST_F(BufferTest, ARefusedFrameIsNeverReleasedAndAKeptOneExactlyOnceByItsLastHo
   EXPECT_EQ(4u, host.Total());
   for (const auto& entry : host.All()) EXPECT_EQ(1, entry.second);
   EXPECT_EQ(0u, host.Malformed());
-}
-
-TEST_F(BufferTest, TheReleaseRequestCarriesTheBufferWithModuleIdClassAndNoLength) {
-  ASSERT_TRUE(Feed(true, 100, 1000));
-  const void* kept = lastBuffer;
-  buffer.RemoveStream(kStream);
-  auto releases = host.host().Requests().OfClass(hx::core::kClassFrameRelease);
-  ASSERT_EQ(1u, releases.size());
-  EXPECT_EQ(reinterpret_cast<uintptr_t>(kept), releases[0].dataPointer);
-  EXPECT_EQ(0u, releases[0].length);
-  EXPECT_EQ(0u, releases[0].code);
-  EXPECT_EQ(hx::core::kModuleId, releases[0].requester);
-  EXPECT_EQ(0u, host.Malformed());
-}
-
-TEST_F(BufferTest, DestroyingTheBufferReleasesEveryKeptFrameOnce) {
-  std::vector<const void*> kept;
-  {
-    hx::VideoBuffer local(host.callback());
-    for (uint32_t i = 0; i < 50; ++i) {
-      const void* data = FakeBuffer(1000 + i);
-      if (local.AddFrame(static_cast<int32_t>(i % 3), i % 5 == 0 ? 1 : 0, 0, data, 100,
-                         Format(hx::kCodecH264))) {
-        kept.push_back(data);
-      }
-    }
-    EXPECT_EQ(0u, host.Total());
-  }
-  EXPECT_EQ(kept.size(), host.Total());
-  for (const void* data : kept) EXPECT_EQ(1, host.Releases(data));
 }
 
 TEST(FrameDataTest, WithoutHostOrAfterClearNothingIsSent) {
