@@ -16,8 +16,9 @@ using cliptest::HostClip;
 using cliptest::MediaFrame;
 using cliptest::MediaSpec;
 
-// Put in front of every payload, as the host does with its frame header.
-const std::string kHostHeader = "HOSTFRAMEHEADER-24-BYTES";
+// Put in front of every payload, as the host does with its frame header. Its
+// binary fields may look like a start code, as this one does.
+const std::string kHostHeader("HOSTFRAME\x00\x00\x01\x65HEADER-24B", 24);
 
 class ClipWriterTest : public ::testing::Test {
  protected:
