@@ -45,6 +45,12 @@ using RunProcessFn = void (*)(const std::vector<std::string>& arguments, const s
 // takes the id after it.
 using SetLastProcessIdFn = void (*)(uint32_t id);
 
+// "SetFreeBytesQuery": replaces the free-space query of the data volume;
+// the query fills `bytes` and returns true, or returns false when the volume
+// cannot be queried. Null restores the system's query.
+using FreeBytesFn = bool (*)(void* context, uint64_t* bytes);
+using SetFreeBytesQueryFn = void (*)(FreeBytesFn query, void* context);
+
 }  // namespace testhooks
 
 #endif  // ALERTMOD_TESTS_SUPPORT_MODULE_HOOKS_H_
