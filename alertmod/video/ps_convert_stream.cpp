@@ -108,6 +108,7 @@ int PSConvertAVCodecStream::Open(const PSFileHeader& header, const IPSConvertStr
   m_slots = {};
   m_heldBack.clear();
   m_headerWritten = false;
+  m_headerFailed = false;
   m_haveStartTime = false;
   if (!CreateStreams(info)) {
     Release(true);
@@ -202,6 +203,7 @@ int PSConvertAVCodecStream::WritePacket(const _PSFILE_PACKET& packet) {
   StreamSlot& slot = m_slots[packet.streamIndex];
   if (slot.stream == nullptr) return 0;
   if (m_headerWritten) return WriteToContainer(&slot, packet);
+  if (m_headerFailed) return kConvertHeaderFailed;
   CollectConfiguration(&slot, packet);
   HoldBack(packet);
   return AllConfigured() ? WriteHeader() : 0;
@@ -252,13 +254,15 @@ void PSConvertAVCodecStream::HoldBack(const _PSFILE_PACKET& packet) {
 }
 
 int PSConvertAVCodecStream::WriteHeader() {
-  if (m_context == nullptr) return kConvertHeaderFailed;
+  if (m_context == nullptr || m_headerFailed) return kConvertHeaderFailed;
   if (m_headerWritten) return 0;
   m_libs.av_dict_set(&m_formatOptions, "use_editlist", "0", 0);
   for (const PSConvertOption& option : m_options) {
     m_libs.av_dict_set(&m_formatOptions, option.name.c_str(), option.value.c_str(), option.flags);
   }
   if (m_libs.avformat_write_header(m_context, &m_formatOptions) < 0) {
+    // A container that failed its header is in no state to be asked again.
+    m_headerFailed = true;
     m_heldBack.clear();
     return kConvertHeaderFailed;
   }

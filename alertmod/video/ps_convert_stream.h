@@ -78,7 +78,8 @@ class IPSConvertStream {
   // is removed, so a broken file is never left behind.
   virtual int Close() = 0;
   // Writes the container header now if not yet done, then the held-back
-  // packets. Returns 0 (also when already written) or kConvertHeaderFailed.
+  // packets. Returns 0 (also when already written) or kConvertHeaderFailed,
+  // also on every later call once the header was refused.
   virtual int WriteHeader() = 0;
   // True when the name gives a container format.
   virtual bool CanWrite(const std::string& fileName) = 0;
@@ -151,6 +152,7 @@ class PSConvertAVCodecStream final : public IPSConvertStream {
   std::string m_fileName;
   bool m_isAvi = false;
   bool m_headerWritten = false;
+  bool m_headerFailed = false;  // the container refused its header; never retried
   bool m_haveStartTime = false;
   int64_t m_startTimeMs = 0;
   std::array<StreamSlot, kMaxConvertStreams> m_slots;

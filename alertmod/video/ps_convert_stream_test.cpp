@@ -125,5 +125,20 @@ TEST_F(StreamMuxerTest, DescribesItsStreams) {
   EXPECT_FALSE(testsupport::FileExists(path));
 }
 
+TEST_F(StreamMuxerTest, ARefusedHeaderIsNotRetried) {
+  const cliptest::MediaSpec spec{kCodecH264, 320, 240, 3, 3};
+  const std::vector<cliptest::MediaFrame> frames = cliptest::MakeFrames(spec, m_dir.path());
+  ASSERT_EQ(frames.size(), 3u);
+  PSConvertAVCodecStream muxer;
+  muxer.SetOptions({{"moov_size", "not a number", 0}});
+  const std::string path = m_dir.File("refused.mov");
+  ASSERT_EQ(muxer.Open(PSFileHeader(), OneVideoStream(kPSCodecH264, 320, 240, 25), path), 0);
+  EXPECT_EQ(muxer.WritePacket(Packet(frames[0].payload, true, 1000)), kConvertHeaderFailed);
+  EXPECT_EQ(muxer.WritePacket(Packet(frames[1].payload, false, 1040)), kConvertHeaderFailed);
+  EXPECT_EQ(muxer.WriteHeader(), kConvertHeaderFailed);
+  EXPECT_EQ(muxer.Close(), kConvertHeaderFailed);
+  EXPECT_FALSE(testsupport::FileExists(path));
+}
+
 }  // namespace
 }  // namespace hx
