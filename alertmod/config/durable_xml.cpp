@@ -45,11 +45,20 @@ std::string WriteSideFile(const std::string& sideName, const std::string& text) 
   return failure;
 }
 
+// The XML library reads a whole file into memory at the size the system
+// reports, so anything but a regular file of sensible size (a directory
+// reports an enormous one) would exhaust memory instead of failing.
+constexpr uint64_t kLargestXmlFileBytes = 64ull << 20;
+
+bool LoadDocumentFile(TiXmlDocument& document, const std::string& name) {
+  return platform::IsRegularFileUpTo(name, kLargestXmlFileBytes) && document.LoadFile(name);
+}
+
 // A side file is adopted only when it holds a whole document: one cut short
 // right after its declaration parses without error but has no root element,
 // and adopting it would replace the configuration with nothing.
 bool LoadCompleteSideFile(TiXmlDocument& document, const std::string& sideName) {
-  return document.LoadFile(sideName) && document.RootElement() != nullptr;
+  return LoadDocumentFile(document, sideName) && document.RootElement() != nullptr;
 }
 
 }  // namespace
@@ -114,7 +123,7 @@ bool LoadXmlDurably(TiXmlDocument& document, const std::string& fileName) {
     }
     return true;
   }
-  return document.LoadFile(fileName);
+  return LoadDocumentFile(document, fileName);
 }
 
 }  // namespace hx

@@ -200,6 +200,18 @@ TEST(DurableXmlTest, LoadFailsForMissingOrMalformedFiles) {
   EXPECT_FALSE(LoadXmlDurably(document, dir.File("notify.xml")));
 }
 
+TEST(DurableXmlTest, DirectoriesInPlaceOfTheFilesAreNotRead) {
+  // A directory reports an enormous size; reading it whole would exhaust
+  // memory instead of failing.
+  TempDir dir;
+  ASSERT_EQ(mkdir(dir.File("notify.xml.pending").c_str(), 0755), 0);
+  ASSERT_TRUE(WriteFile(dir.File("notify.xml"), "<Trellan Delta=\"0\" />"));
+  TiXmlDocument document;
+  EXPECT_TRUE(LoadXmlDurably(document, dir.File("notify.xml")));
+  ASSERT_EQ(mkdir(dir.File("other.xml").c_str(), 0755), 0);
+  EXPECT_FALSE(LoadXmlDurably(document, dir.File("other.xml")));
+}
+
 // Saves of one name from two threads must not meet inside the guard: each
 // would otherwise remove or fail to create the other's side file.
 std::atomic<int> g_insideSave{0};

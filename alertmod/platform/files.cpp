@@ -59,5 +59,11 @@ int SyncParentDirectory(const std::string& path) {
   return error;
 }
 
+bool IsRegularFileUpTo(const std::string& path, uint64_t maxBytes) {
+  struct stat info {};
+  return stat(path.c_str(), &info) == 0 && S_ISREG(info.st_mode) &&
+         static_cast<uint64_t>(info.st_size) <= maxBytes;
+}
+
 }  // namespace platform
 }  // namespace hx

@@ -6,6 +6,7 @@
 #define ALERTMOD_PLATFORM_FILES_H_
 
 #include <cstddef>
+#include <cstdint>
 #include <string>
 
 namespace hx {
@@ -34,6 +35,10 @@ int RenameReplacing(const std::string& from, const std::string& to);
 // Forces the directory that holds `path` to the storage device, so that a
 // rename into it survives a power loss.
 int SyncParentDirectory(const std::string& path);
+
+// True when `path` is a regular file (symbolic links followed) of at most
+// `maxBytes` bytes.
+bool IsRegularFileUpTo(const std::string& path, uint64_t maxBytes);
 
 }  // namespace platform
 }  // namespace hx
