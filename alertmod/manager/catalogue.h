@@ -97,8 +97,11 @@ class HostSystemCatalogue {
 
   // Rebuilds the catalogue from a full host system document. Does nothing
   // unless `trellan` is named exactly "Trellan" and its integer "Delta" is 0
-  // or missing. Entries of a plug-in are replaced only when the document
-  // lists that plug-in's "Devices"; elements lacking a required integer
+  // or missing. The streams, names and camera lists of a plug-in are replaced
+  // only when the document lists that plug-in's "Devices" (a stream that is
+  // no longer listed loses its format record too); the serial profiles, the
+  // cases and, when the document has POS/ATM profiles, the keyword table are
+  // rebuilt from every full document. Elements lacking a required integer
   // attribute are skipped with their children. Any element tree gives a
   // defined result.
   void RebuildCatalogue(const TiXmlElement& trellan);
@@ -112,7 +115,7 @@ class HostSystemCatalogue {
   // The format record of stream `streamId`, or nullopt when it has none.
   std::optional<StreamFormatRecord> StreamFormat(int32_t streamId) const;
 
-  // The extra streams (context 1 and above) of the camera with key
+  // The named extra streams (context 1 and above) of the camera with key
   // `cameraKey` (see CameraKey), in document order; empty when none.
   std::vector<int32_t> CameraStreams(uint32_t cameraKey) const;
 
