@@ -101,7 +101,11 @@ TEST_F(ClipWriterTest, ClipsPlayBackWithTheirStreamDescription) {
     EXPECT_EQ(cliptest::DecodeErrors(path), "");
 
     const std::vector<uint8_t> file = cliptest::ReadBytes(path);
-    EXPECT_FALSE(cliptest::ContainsBoxType(cliptest::MoovBox(file), "elst"));
+    const std::vector<uint8_t> moov = cliptest::MoovBox(file);
+    EXPECT_FALSE(cliptest::ContainsBoxType(moov, "elst"));
+    // Exact, not rounded down to 16-pixel units (1080 would become 1072).
+    EXPECT_EQ(cliptest::TrackHeaderSize(moov),
+              std::to_string(c.spec.width) + "x" + std::to_string(c.spec.height));
     const auto boxes = cliptest::TopLevelBoxes(file);
     ASSERT_GE(boxes.size(), 3u);
     EXPECT_EQ(boxes[1].first, "moov");  // the reserved movie header comes first

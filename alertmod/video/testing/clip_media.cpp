@@ -226,6 +226,20 @@ bool ContainsBoxType(const std::vector<uint8_t>& bytes, const char* type) {
   return std::string(bytes.begin(), bytes.end()).find(needle) != std::string::npos;
 }
 
+std::string TrackHeaderSize(const std::vector<uint8_t>& moov) {
+  const std::string bytes(moov.begin(), moov.end());
+  const size_t type = bytes.find("tkhd");
+  if (type == std::string::npos || type < 4) return "";
+  auto u32 = [&](size_t at) {
+    return (uint32_t{moov[at]} << 24) | (uint32_t{moov[at + 1]} << 16) |
+           (uint32_t{moov[at + 2]} << 8) | moov[at + 3];
+  };
+  const size_t end = type - 4 + u32(type - 4);
+  if (end > moov.size() || end < type + 8) return "";
+  // The box ends with width and height as 16.16 fixed-point numbers.
+  return std::to_string(u32(end - 8) >> 16) + "x" + std::to_string(u32(end - 4) >> 16);
+}
+
 std::vector<std::pair<std::string, uint64_t>> TopLevelBoxes(const std::vector<uint8_t>& bytes) {
   std::vector<std::pair<std::string, uint64_t>> boxes;
   uint64_t offset = 0;

@@ -90,6 +90,10 @@ std::vector<uint8_t> MoovBox(const std::vector<uint8_t>& file);
 // True when the four-letter box type `type` occurs anywhere in `bytes`.
 bool ContainsBoxType(const std::vector<uint8_t>& bytes, const char* type);
 
+// The picture size that the first track header ("tkhd") in `moov` states,
+// as "WIDTHxHEIGHT"; empty when there is none.
+std::string TrackHeaderSize(const std::vector<uint8_t>& moov);
+
 // Top-level boxes of an MP4/QuickTime file in order, as (type, offset).
 std::vector<std::pair<std::string, uint64_t>> TopLevelBoxes(const std::vector<uint8_t>& bytes);
 
