@@ -50,7 +50,7 @@ bool FitsRecord(const std::vector<uint8_t>& set) {
 
 // Reads the bits of a NAL unit's payload with its emulation prevention bytes
 // (00 00 03) removed. Reading past the end yields zero bits and sets a flag.
-class RbspReader {
+class RbspReader final {
  public:
   RbspReader(const uint8_t* data, size_t size) {
     m_bytes.reserve(size);
