@@ -278,6 +278,15 @@ void AddAnalytics(TiXmlElement* root, const std::vector<AnalyticsInputDescriptio
   }
 }
 
+void AddEventSource(TiXmlElement* parent, const AlarmRequest::Source& source) {
+  TiXmlElement* element = AddChild(parent, "EventSource");
+  element->SetAttribute("Plugin", source.plugin);
+  element->SetAttribute("Device", source.device);
+  element->SetAttribute("Input", source.input);
+  element->SetAttribute("Context", source.context);
+  element->SetAttribute("Type", source.type);
+}
+
 void AddAlarmRequest(TiXmlElement* profiles, const AlarmRequest& request) {
   TiXmlElement* element = AddChild(profiles, "Profile");
   if (request.alarm) element->SetAttribute("Alarm", *request.alarm);
@@ -287,14 +296,11 @@ void AddAlarmRequest(TiXmlElement* profiles, const AlarmRequest& request) {
   if (request.time) element->SetAttribute("Time", std::to_string(*request.time));
   if (request.milliseconds) element->SetAttribute("Milliseconds", *request.milliseconds);
   if (request.source) {
-    TiXmlElement* source = AddChild(element, "EventSource");
-    source->SetAttribute("Plugin", request.source->plugin);
-    source->SetAttribute("Device", request.source->device);
-    source->SetAttribute("Input", request.source->input);
-    source->SetAttribute("Context", request.source->context);
-    source->SetAttribute("Type", request.source->type);
+    AddEventSource(element, *request.source);
   } else if (request.group) {
-    AddChild(element, "SourceGroup")->SetAttribute("ID", *request.group);
+    TiXmlElement* group = AddChild(element, "SourceGroup");
+    group->SetAttribute("ID", *request.group);
+    for (const AlarmRequest::Source& member : request.groupMembers) AddEventSource(group, member);
   }
 }
 

@@ -183,6 +183,8 @@ struct AlarmRequest {
   };
   std::optional<Source> source = Source();
   std::optional<int32_t> group;
+  // The group's members, written as "EventSource" children of "SourceGroup".
+  std::vector<Source> groupMembers;
 };
 
 struct AlarmDocument {

@@ -246,26 +246,36 @@ TEST_F(ConfigCommandsTest, EmptyOldServerListCountsAsChanged) {
   EXPECT_EQ(Reports(), (std::vector<std::pair<int32_t, int32_t>>{{1, -1}, {3, -1}}));
 }
 
-TEST_F(ConfigCommandsTest, RejectedUpdateChangesNothing) {
+TEST_F(ConfigCommandsTest, RejectedUpdateKeepsOnlyTheLimitsItCarried) {
+  ASSERT_TRUE(
+      WriteFile("notify.xml", "<Trellan>" + Notify(Server("main"), Profile(1)) + "</Trellan>"));
   StartHost();
   size_t posts = PostCount();
   size_t lines = host().Log().Lines().size();
-  struct Case {
-    std::string notify;
+  const std::string rejected[] = {
+      "<Notify ID=\"786433\" MaxRetryQueue=\"7\"><Servers/><Profiles/></Notify>",
+      "<Notify ID=\"786432\" MaxRetryQueue=\"5\"><Servers/></Notify>",
+      "<Notify ID=\"786432\" EmailSizeLimitMB=\"1\" MaxRetrySeconds=\"60\"><Profiles/></Notify>",
   };
-  const Case cases[] = {
-      {"<Notify ID=\"786433\"><Servers/><Profiles/></Notify>"},
-      {"<Notify ID=\"786432\" MaxRetryQueue=\"5\"><Servers/></Notify>"},
-      {"<Notify ID=\"786432\" EmailSizeLimitMB=\"1\"><Profiles/></Notify>"},
-  };
-  for (const Case& c : cases) EXPECT_EQ(ApplyUpdate(c.notify), 0) << c.notify;
+  for (const std::string& notify : rejected) EXPECT_EQ(ApplyUpdate(notify), 0) << notify;
   EXPECT_EQ(PostCount(), posts);
   EXPECT_TRUE(Reports().empty());
   EXPECT_EQ(host().Log().Lines().size(), lines);
-  // A later accepted update shows that the rejected limits were not kept.
-  ASSERT_EQ(ApplyUpdate(Notify("", "")), 1);
-  EXPECT_EQ(AttributeOf(Posted(), "Notify", "MaxRetryQueue"), "100");
-  EXPECT_EQ(AttributeOf(Posted(), "Notify", "EmailSizeLimitMB"), "10");
+
+  // The video buffer follows the new size limit at once.
+  auto state = reinterpret_cast<testhooks::GetManagerStateFn>(host().Hook("GetManagerState"));
+  ASSERT_NE(state, nullptr);
+  testhooks::ManagerStateRecord record;
+  ASSERT_TRUE(host().GetDispatcher().Call([&] { return state(record); }));
+  EXPECT_EQ(record.videoBufferMaxBytes, 1048576u);
+
+  // The next post shows the limits with the servers and profiles of before.
+  ASSERT_EQ(ApplyReviewer("1"), 1);
+  EXPECT_EQ(AttributeOf(Posted(), "Notify", "MaxRetryQueue"), "5");
+  EXPECT_EQ(AttributeOf(Posted(), "Notify", "MaxRetrySeconds"), "60");
+  EXPECT_EQ(AttributeOf(Posted(), "Notify", "EmailSizeLimitMB"), "1");
+  EXPECT_EQ(AttributeOf(Posted(), "smtp", "description"), "main");
+  EXPECT_NE(Posted().find("description=\"P1\""), std::string::npos);
 }
 
 TEST_F(ConfigCommandsTest, SecondReviewerModeWithdrawsAttachments) {

@@ -99,14 +99,15 @@ void NotifyManager::LoadConfig() {
   ProbeSmtps(m_config);
   PostModuleDescription(m_callback);
   TiXmlDocument document;
-  // Parsed into a copy: a file that is rejected halfway leaves the defaults.
-  NotifyCfg loaded = m_config;
-  if (LoadXmlDurably(document, kConfigFileName) && loaded.Parse(document, m_configServices)) {
-    m_config = std::move(loaded);
+  const bool loaded =
+      LoadXmlDurably(document, kConfigFileName) && m_config.Parse(document, m_configServices);
+  // A file rejected for a missing "Servers" or "Profiles" still sets the
+  // three limits it carries; the worker and the video buffer follow them.
+  SetVideoBufferLimit(m_config.EmailSizeLimitBytes());
+  PublishConfigSettings();
+  if (loaded) {
     LogToHost(core::kModuleId, m_callback, LogLevelInfo,
               "Loaded configuration from disk successfully");
-    SetVideoBufferLimit(m_config.EmailSizeLimitBytes());
-    PublishConfigSettings();
     return;
   }
   LogToHost(core::kModuleId, m_callback, LogLevelWarning,
@@ -130,11 +131,14 @@ void NotifyManager::PostConfig() {
 }
 
 bool NotifyManager::ApplyConfigurationUpdate(const TiXmlDocument& document) {
-  // Parsed into a copy, so that a rejected update changes nothing at all.
-  NotifyCfg updated = m_config;
-  if (!updated.Parse(document, m_configServices)) return false;
-  NotifyCfg previous = std::move(m_config);
-  m_config = std::move(updated);
+  const NotifyCfg previous = m_config;
+  if (!m_config.Parse(document, m_configServices)) {
+    // An update without "Servers" or "Profiles" is rejected after its three
+    // limits were read; they stay, so the worker and the video buffer must
+    // hear of them. Nothing is saved, posted or reported.
+    ApplyLimitChanges(previous);
+    return false;
+  }
   LogToHost(core::kModuleId, m_callback, LogLevelInfo, "Updated configuration successfully");
   PostConfig();
   PublishConfigSettings();
@@ -146,6 +150,16 @@ bool NotifyManager::ApplyConfigurationUpdate(const TiXmlDocument& document) {
     SetVideoBufferLimit(m_config.EmailSizeLimitBytes());
   }
   return true;
+}
+
+void NotifyManager::ApplyLimitChanges(const NotifyCfg& before) {
+  if (before.MaxRetrySeconds() != m_config.MaxRetrySeconds() ||
+      before.MaxRetryQueue() != m_config.MaxRetryQueue()) {
+    PublishConfigSettings();
+  }
+  if (before.EmailSizeLimitMB() != m_config.EmailSizeLimitMB()) {
+    SetVideoBufferLimit(m_config.EmailSizeLimitBytes());
+  }
 }
 
 bool NotifyManager::ApplySecondReviewer(const TiXmlDocument& document) {
@@ -170,9 +184,7 @@ void NotifyManager::PublishConfigSettings() {
 }
 
 void NotifyManager::SetVideoBufferLimit(int64_t bytes) {
-  // The one place where the video buffer learns the configured limit
-  // (VideoBuffer::SetMaxBytes); the buffer is not part of the manager yet.
-  (void)bytes;
+  m_videoBuffer.SetMaxBytes(bytes > 0 ? static_cast<uint64_t>(bytes) : 0);
 }
 
 }  // namespace hx

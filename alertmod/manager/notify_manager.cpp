@@ -18,17 +18,26 @@ std::atomic<int64_t> g_watchdogPeriodMs{kDefaultWatchdogPeriod.count()};
 
 }  // namespace
 
-void SNOTIFY_CALLBACK::OnReady() { m_manager->MoveToReady(this); }
+void SNOTIFY_CALLBACK::OnReady() {
+  m_manager->MoveToReady(this);
+}
 
 NotifyManager::NotifyManager(core::HostCallbackFn callback, WorkerJobFactory jobFactory)
     : m_callback(callback),
       m_jobFactory(std::move(jobFactory)),
       m_watchdogPeriod(g_watchdogPeriodMs.load()),
-      m_configServices(MakeConfigServices(callback)) {
+      m_configServices(MakeConfigServices(callback)),
+      m_videoBuffer(callback) {
   GetLgr()->SetFileName("notifylog.txt");
 }
 
-NotifyManager::~NotifyManager() = default;
+NotifyManager::~NotifyManager() {
+  // A waiting notification and its captures hold each other (the item holds
+  // the capture, the capture its completion); the item is let go here so
+  // that the captures' frames go back to the host with the video buffer.
+  for (const auto& callback : m_pending) callback->m_item.reset();
+  for (const auto& callback : m_ready) callback->m_item.reset();
+}
 
 void NotifyManager::SetWatchdogPeriod(std::chrono::milliseconds period) {
   g_watchdogPeriodMs.store(period.count());
@@ -94,8 +103,7 @@ void NotifyManager::RunItem(IWorkerJob& job, NotifyWorkItem& item) {
               item.profile.description.c_str(), e.what());
   } catch (...) {
     LogToHost(core::kModuleId, m_callback, LogLevelError,
-              "Notification for profile %s failed unexpectedly",
-              item.profile.description.c_str());
+              "Notification for profile %s failed unexpectedly", item.profile.description.c_str());
   }
 }
 
@@ -180,9 +188,22 @@ void NotifyManager::Park(std::shared_ptr<SNOTIFY_CALLBACK> callback) {
   m_pending.push_back(std::move(callback));
 }
 
+bool NotifyManager::Unpark(const SNOTIFY_CALLBACK* callback) {
+  auto found = std::find_if(m_pending.begin(), m_pending.end(),
+                            [callback](const auto& c) { return c.get() == callback; });
+  if (found == m_pending.end()) return false;
+  m_pending.erase(found);
+  return true;
+}
+
 void NotifyManager::ReleaseReady() {
   while (!m_ready.empty()) {
     std::shared_ptr<SNOTIFY_CALLBACK> callback = m_ready.front();
+    // Streams still collecting are closed with what they hold; their
+    // completions find this notification no longer pending.
+    for (VideoSource& source : callback->m_item->videoSources) {
+      if (source.stream) source.stream->Finish();
+    }
     QueueWorkItem(callback->m_item, false);
     m_ready.erase(m_ready.begin());
   }

@@ -18,15 +18,22 @@
 #include <deque>
 #include <memory>
 #include <mutex>
+#include <string>
 #include <vector>
 
 #include "alertmod/config/notify_cfg.h"
 #include "alertmod/host_records.h"
 #include "alertmod/mail/notify_work_item.h"
+#include "alertmod/manager/catalogue.h"
+#include "alertmod/manager/source_aliases.h"
+#include "alertmod/manager/stream_links.h"
+#include "alertmod/manager/throttle.h"
 #include "alertmod/manager/worker_job.h"
 #include "alertmod/video/notify_ready.h"
+#include "alertmod/video/video_buffer.h"
 
 class TiXmlDocument;
+class TiXmlElement;
 
 namespace hx {
 
@@ -46,6 +53,15 @@ struct SNOTIFY_CALLBACK final : public INotifyReady {
   std::shared_ptr<NotifyWorkItem> m_item;
   int64_t m_deadline;  // seconds since 1970
 };
+
+// What the alarm documents tell of the recording server, for the messages.
+struct ServerIdentity {
+  std::string serial;
+  std::string systemName;   // the server's description
+  std::string licensedMac;  // empty until the host reports it
+};
+
+struct CaptureContext;
 
 class NotifyManager {
  public:
@@ -83,10 +99,22 @@ class NotifyManager {
   void Park(std::shared_ptr<SNOTIFY_CALLBACK> callback);
 
   // Host-thread entry points of the parts built on the manager.
+  //
+  // Loads "notify.xml" and posts the configuration.
   void Open();
+  // Offers one frame of stream `streamId` (Write class 1) to the video
+  // buffer when buffering is on and the stream is wanted and described.
+  // Returns whether the frame was kept; a kept buffer is released to the
+  // host when its last holder lets go, a refused one never.
   bool OnFrame(uint32_t streamId, uint8_t frameType, uint32_t payloadOffset, const void* data,
                uint32_t length);
+  // Handles an alarm document of another module: the server's serial and
+  // description, and every request addressed to this module. Any bytes give
+  // a defined result; text that is not XML changes nothing.
   void OnAlarmDocument(const void* data, uint32_t length);
+  // Handles a host system document (IOCTL code 2): catalogue, wanted video,
+  // second reviewer mode, pre-alarm times, analytics aliases and
+  // configuration updates. Any bytes give a defined result.
   void OnHostDocument(const void* data, uint32_t length);
 
   // Configuration commands, on the host threads of Open and IOCTL code 2.
@@ -95,8 +123,10 @@ class NotifyManager {
   // it to the host (passwords in clear). A failed save is logged; the
   // configuration is still posted.
   void PostConfig();
-  // Applies the "Notify" element of a host document. False, with nothing
-  // changed, when the configuration parser rejects it; otherwise the new
+  // Applies the "Notify" element of a host document. False when the
+  // configuration parser rejects it: nothing is saved, posted or reported,
+  // and only the three limits it read before the rejection (an element
+  // without "Servers" or "Profiles") take effect. Otherwise the new
   // configuration is saved and posted, and the profiles whose last delivery
   // result no longer applies are reported with status -1.
   bool ApplyConfigurationUpdate(const TiXmlDocument& document);
@@ -116,15 +146,33 @@ class NotifyManager {
 
   core::HostCallbackFn Callback() const { return m_callback; }
 
-  // Read access for tests and the parts built on the manager.
+  // Replaces the job factory; the next RunWorker uses it. Tests only, and
+  // only before the worker is entered.
+  void SetWorkerJobFactory(WorkerJobFactory factory) { m_jobFactory = std::move(factory); }
+
+  // Read access for tests and the parts built on the manager. Host threads.
   size_t PendingCount() const { return m_pending.size(); }
   size_t ReadyCount() const { return m_ready.size(); }
   size_t QueuedCount() const;
+  const HostSystemCatalogue& Catalogue() const { return m_catalogue; }
+  const WantedVideo& Wanted() const { return m_wanted; }
+  const SourceAliases& Aliases() const { return m_aliases; }
+  const VideoBuffer& Video() const { return m_videoBuffer; }
+  const ThrottleTable& Throttle() const { return m_throttle; }
+  const ServerIdentity& Server() const { return m_server; }
 
  private:
   friend struct SNOTIFY_CALLBACK;
 
   void MoveToReady(const SNOTIFY_CALLBACK* callback);
+  bool Unpark(const SNOTIFY_CALLBACK* callback);
+  void ReleasePendingOfSource(uint32_t key, bool alarmStarts);
+  void HandleAlarmRequest(const TiXmlElement& request);
+  void RaiseNotification(const std::shared_ptr<NotifyWorkItem>& item, const NotifyProfile& profile,
+                         const TiXmlElement& request);
+  CaptureContext MakeCaptureContext();
+  void ApplyFullDocument(const TiXmlDocument& document, const TiXmlElement& trellan);
+  void ApplyLimitChanges(const NotifyCfg& before);
   std::shared_ptr<NotifyWorkItem> TakeItem(const IWorkerJob& job);
   bool TakeSettingsChange(WorkerSettings* settings);
   void RunItem(IWorkerJob& job, NotifyWorkItem& item);
@@ -136,7 +184,7 @@ class NotifyManager {
   static ConfigServices MakeConfigServices(core::HostCallbackFn callback);
 
   const core::HostCallbackFn m_callback;
-  const WorkerJobFactory m_jobFactory;
+  WorkerJobFactory m_jobFactory;
   const std::chrono::milliseconds m_watchdogPeriod;
   const ConfigServices m_configServices;
 
@@ -154,6 +202,14 @@ class NotifyManager {
   std::mutex m_stopMutex;
   std::condition_variable m_stopSignal;
   bool m_stopped = false;  // guarded by m_stopMutex
+
+  // Host-side state: Write and IOCTL code 2 only, one call at a time.
+  ThrottleTable m_throttle;
+  VideoBuffer m_videoBuffer;
+  HostSystemCatalogue m_catalogue;
+  WantedVideo m_wanted;  // the video source set and the source link map
+  SourceAliases m_aliases;
+  ServerIdentity m_server;
 };
 
 }  // namespace hx

@@ -7,6 +7,7 @@
 
 #include <cstdint>
 #include <string>
+#include <utility>
 #include <vector>
 
 namespace testhooks {
@@ -50,6 +51,70 @@ using SetLastProcessIdFn = void (*)(uint32_t id);
 // cannot be queried. Null restores the system's query.
 using FreeBytesFn = bool (*)(void* context, uint64_t* bytes);
 using SetFreeBytesQueryFn = void (*)(FreeBytesFn query, void* context);
+
+// What a recorded work item carries, as the worker receives it.
+struct CapturedVideoRecord {
+  uint32_t sourceKey = 0;
+  std::string name;
+  bool hasStream = false;  // the rest is set only with a stream
+  bool done = false;
+  uint32_t codec = 0;
+  uint32_t width = 0;
+  uint32_t height = 0;
+  uint64_t frames = 0;
+  uint64_t bytes = 0;
+  uint64_t gops = 0;
+  uint32_t firstFrameMs = 0;  // arrival ticks of the clip's first and last frames
+  uint32_t lastFrameMs = 0;
+  uint32_t triggerMs = 0;
+};
+struct WorkItemRecord {
+  uint32_t type = 0;
+  int32_t profileId = 0;
+  std::string profileDescription;
+  bool attach = false;
+  int32_t preAlarmSeconds = 0;
+  int32_t maxVideoSeconds = 0;
+  int64_t sizeLimit = 0;
+  std::string body;
+  size_t servers = 0;
+  int64_t eventTime = 0;
+  uint16_t milliseconds = 0;
+  std::string sourceName;
+  uint32_t sourceKey = 0;
+  int32_t eventType = 0;
+  std::string webAddress;
+  std::string serial;
+  std::string systemName;
+  std::string licensedMac;
+  std::string eventState;
+  std::vector<CapturedVideoRecord> videoSources;
+};
+// Called on the worker thread with each item, before the notification job
+// runs on it.
+using WorkItemRecorderFn = void (*)(const WorkItemRecord& record, void* context);
+// "SetWorkItemRecorder": makes the live manager's worker report every item to
+// `recorder`. Call after Load and before the worker thread is lent. False
+// without a manager.
+using SetWorkItemRecorderFn = bool (*)(WorkItemRecorderFn recorder, void* context);
+
+// The live manager's host-side state.
+struct ManagerStateRecord {
+  size_t pending = 0;
+  size_t ready = 0;
+  size_t queued = 0;
+  std::vector<uint32_t> videoSources;                  // ascending
+  std::vector<std::pair<uint32_t, int32_t>> links;     // source key -> linked stream ID
+  std::vector<int32_t> bufferedStreams;                // streams the video buffer holds
+  std::vector<std::pair<uint32_t, uint32_t>> aliases;  // analytics key -> camera key
+  std::vector<uint32_t> unresolvedAnalytics;
+  std::string serverSerial;
+  std::string systemName;
+  uint64_t videoBufferMaxBytes = 0;
+};
+// "GetManagerState": fills `state` from the live manager; false without one.
+// Call on the host's dispatcher thread.
+using GetManagerStateFn = bool (*)(ManagerStateRecord& state);
 
 }  // namespace testhooks
 
