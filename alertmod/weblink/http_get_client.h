@@ -58,7 +58,6 @@ class HttpGetClient {
 
   const std::string& host() const { return m_host; }
   const std::string& port() const { return m_port; }
-  boost::asio::io_context& io() { return m_io; }
 
  private:
   using Deadline = std::chrono::steady_clock::time_point;

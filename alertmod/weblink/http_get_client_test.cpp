@@ -201,6 +201,23 @@ TEST(HttpGetClientTest, SilentServerTimesOut) {
   }
 }
 
+// A listener that never accepts, its queue already full, drops the client's
+// connection request: the connection attempt itself runs into the time-out.
+TEST(HttpGetClientTest, UnansweredConnectionTimesOut) {
+  boost::asio::io_context io;
+  tcp::acceptor acceptor(io, tcp::endpoint(boost::asio::ip::make_address("127.0.0.1"), 0), false);
+  acceptor.listen(0);
+  std::vector<tcp::socket> queued;
+  // The requests go out when the operations start; `io` never runs them on.
+  for (int i = 0; i < 4; ++i) {
+    queued.emplace_back(io);
+    queued.back().async_connect(acceptor.local_endpoint(), [](const boost::system::error_code&) {});
+  }
+  Outcome outcome = GetFrom("127.0.0.1", acceptor.local_endpoint().port(), kShortTimeout);
+  EXPECT_EQ(outcome.code, boost::asio::error::timed_out) << outcome.text;
+  EXPECT_EQ(outcome.text, "Unable to connect to endpoint: Connection timed out");
+}
+
 TEST(HttpGetClientTest, ClientsTakeTheProcessWideTimeout) {
   EXPECT_EQ(WebRequestTimeout(), kDefaultWebRequestTimeout);
   SetWebRequestTimeout(kShortTimeout);
