@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <atomic>
-#include <boost/asio/connect.hpp>
 #include <boost/asio/write.hpp>
 #include <boost/system/system_error.hpp>
 #include <utility>
