@@ -58,4 +58,8 @@ const std::set<int32_t>& DeviceHealthEventTypes() {
   return types;
 }
 
+bool IsCameraEventType(int32_t code) {
+  return code == 1 || code == 2 || code == 9 || code == 18;
+}
+
 }  // namespace hx

@@ -24,6 +24,10 @@ const std::set<int32_t>& SystemHealthEventTypes();
 // supply, device failure, fan).
 const std::set<int32_t>& DeviceHealthEventTypes();
 
+// True for the event types whose source is a camera, so that the event has
+// video: 1, 2, 9 and 18.
+bool IsCameraEventType(int32_t code);
+
 }  // namespace hx
 
 #endif  // ALERTMOD_MAIL_EVENT_TYPES_H_

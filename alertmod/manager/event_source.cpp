@@ -5,6 +5,7 @@
 #include <optional>
 
 #include "alertmod/config/xml_attr.h"
+#include "alertmod/mail/event_types.h"
 #include "alertmod/manager/catalogue.h"
 #include "alertmod/manager/event_source_key.h"
 #include "alertmod/manager/source_aliases.h"
@@ -45,16 +46,12 @@ EventSource RequestEventSource(const TiXmlElement& request, const SourceAliases&
   return EventSource{};
 }
 
-bool HasVideo(int32_t eventType) {
-  return eventType == 1 || eventType == 2 || eventType == 9 || eventType == kWholeCameraEventType;
-}
-
 void AppendSourceGroupMembers(const TiXmlElement& sourceGroup, const SourceAliases& aliases,
                               const HostSystemCatalogue& catalogue, NotifyWorkItem& item) {
   for (const TiXmlElement* member = sourceGroup.FirstChildElement("EventSource"); member != nullptr;
        member = member->NextSiblingElement("EventSource")) {
     const EventSource source = ReadEventSource(*member, aliases);
-    if ((source.key == 0 && source.type == 0) || !HasVideo(source.type)) continue;
+    if ((source.key == 0 && source.type == 0) || !IsCameraEventType(source.type)) continue;
     VideoSource video;
     video.sourceKey = source.key;
     video.name = catalogue.SourceName(source.key, source.type);

@@ -40,10 +40,6 @@ EventSource ReadSourceGroup(const TiXmlElement& sourceGroup);
 // its "SourceGroup" child, else key and type 0.
 EventSource RequestEventSource(const TiXmlElement& request, const SourceAliases& aliases);
 
-// True for the event types that come from a camera and so have video:
-// 1, 2, 9 and 18.
-bool HasVideo(int32_t eventType);
-
 // Appends to `item`'s video sources, without streams, the camera members of
 // source group `sourceGroup` (its "EventSource" children with all five
 // integers and an event type that has video), named by `catalogue`.

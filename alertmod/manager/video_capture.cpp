@@ -5,6 +5,7 @@
 #include <string>
 
 #include "alertmod/diag/log.h"
+#include "alertmod/mail/event_types.h"
 #include "alertmod/manager/catalogue.h"
 #include "alertmod/manager/event_source.h"
 #include "alertmod/manager/stream_links.h"
@@ -50,7 +51,7 @@ std::string SetupEventSource(const CaptureContext& context, const TiXmlElement& 
   item.sourceKey = source.key;
   item.eventType = source.type;
   item.sourceName = context.catalogue.SourceName(source.key, source.type);
-  if (HasVideo(source.type)) {
+  if (IsCameraEventType(source.type)) {
     VideoSource video;
     video.sourceKey = source.key;
     video.name = item.sourceName;
