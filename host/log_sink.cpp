@@ -57,6 +57,12 @@ std::vector<LogLine> LogSink::Lines() const {
   return m_lines;
 }
 
+std::vector<LogLine> LogSink::LinesFrom(size_t first) const {
+  std::lock_guard<std::mutex> lock(m_mutex);
+  if (first >= m_lines.size()) return {};
+  return std::vector<LogLine>(m_lines.begin() + static_cast<std::ptrdiff_t>(first), m_lines.end());
+}
+
 bool LogSink::Contains(const std::string& fragment) const {
   std::lock_guard<std::mutex> lock(m_mutex);
   for (const LogLine& line : m_lines) {

@@ -33,6 +33,9 @@ class LogSink {
   void Write(uint32_t source, int32_t level, const std::string& text);
 
   std::vector<LogLine> Lines() const;
+  // The kept lines from the `first`-th on (counted from 0), for readers that
+  // follow the log as it grows.
+  std::vector<LogLine> LinesFrom(size_t first) const;
   // True when some kept line contains `fragment`.
   bool Contains(const std::string& fragment) const;
 

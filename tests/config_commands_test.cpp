@@ -373,7 +373,7 @@ TEST(HostProgramTest, ShowsThePostedConfigurationWithMaskedPasswords) {
       "notify.xml", "<Trellan>" + Notify(Server("main", kPassword), Profile(1)) + "</Trellan>"));
   int status = -1;
   std::string output =
-      RunCommand(std::string(ALERTMOD_HOST_PROGRAM) + " --seconds 0 --show-config --module " +
+      RunCommand(std::string(ALERTMOD_HOST_PROGRAM) + " show-config --module " +
                      testsupport::ProductionModulePath() + " 2>&1",
                  &status);
   EXPECT_EQ(status, 0) << output;

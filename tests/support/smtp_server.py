@@ -4,13 +4,16 @@
 Listens on 127.0.0.1 (port 0 picks a free one), prints "PORT <n>" on standard
 output once it accepts connections, and stores every message it accepts in
 the output directory as <n>.eml (the bytes received) and <n>.env (envelope:
-"from", "rcpt", "login" and "tls" lines).
+"from", "rcpt", "login" and "tls" lines). With --maildir it also delivers each
+message into that Maildir, with Return-Path and Delivered-To lines in front as
+a mail delivery agent writes them.
 Modes: plain, starttls (STARTTLS required) and smtps (TLS from the start).
 With --user and --password, AUTH is required. Runs until killed.
 """
 import argparse
 import asyncio
 import logging
+import mailbox
 import os
 import ssl
 import sys
@@ -20,12 +23,19 @@ from aiosmtpd.smtp import SMTP, AuthResult, LoginPassword
 
 
 class Store:
-    def __init__(self, directory):
+    def __init__(self, directory, maildir=None):
         self.directory = directory
+        self.maildir = mailbox.Maildir(maildir, create=True) if maildir else None
         self.count = 0
 
     async def handle_DATA(self, server, session, envelope):
         self.count += 1
+        if self.maildir is not None:
+            trace = "Return-Path: <%s>\r\n" % envelope.mail_from
+            trace += "".join("Delivered-To: %s\r\n" % rcpt for rcpt in envelope.rcpt_tos)
+            self.maildir.add(trace.encode() + envelope.original_content)
+        if self.directory is None:
+            return "250 OK"
         base = os.path.join(self.directory, "%d" % self.count)
         with open(base + ".eml.tmp", "wb") as f:
             f.write(envelope.original_content)
@@ -78,7 +88,7 @@ def factory(args, handler):
 
 
 async def main(args):
-    handler = Store(args.dir)
+    handler = Store(args.dir, args.maildir)
     ssl_context = tls_context(args.cert, args.key) if args.mode == "smtps" else None
     loop = asyncio.get_running_loop()
     server = await loop.create_server(factory(args, handler), "127.0.0.1", args.port,
@@ -94,14 +104,18 @@ if __name__ == "__main__":
     warnings.filterwarnings("ignore")
     logging.getLogger("mail.log").setLevel(logging.CRITICAL)
     parser = argparse.ArgumentParser()
-    parser.add_argument("--dir", required=True)
+    parser.add_argument("--dir")
+    parser.add_argument("--maildir")
     parser.add_argument("--port", type=int, default=0)
     parser.add_argument("--mode", choices=["plain", "starttls", "smtps"], default="plain")
     parser.add_argument("--cert")
     parser.add_argument("--key")
     parser.add_argument("--user")
     parser.add_argument("--password")
+    arguments = parser.parse_args()
+    if arguments.dir is None and arguments.maildir is None:
+        parser.error("give --dir, --maildir or both")
     try:
-        asyncio.run(main(parser.parse_args()))
+        asyncio.run(main(arguments))
     except KeyboardInterrupt:
         sys.exit(0)
