@@ -222,6 +222,8 @@ void PrintValidation(const std::string& name, const OpenedModule& opened,
   }
   if (opened.configuration.empty()) {
     printf("The module posted no configuration.\n");
+  } else if (!Logged(opened, kLoadedLine)) {
+    printf("The module could not use the file and goes on with its defaults.\n");
   } else {
     printf("The module's configuration:\n");
     for (const std::string& text : DescribeConfiguration(opened.configuration)) {

@@ -31,6 +31,11 @@ std::string ProfileList(const std::vector<AlarmRequest>& requests) {
   return (requests.size() == 1 ? "profile " : "profiles ") + list;
 }
 
+// Where a timeline entry stands in the scenario file, for the live log.
+std::string LineOf(const TimelineEntry& entry) {
+  return entry.line > 0 ? " (line " + std::to_string(entry.line) + ")" : std::string();
+}
+
 }  // namespace
 
 ScenarioRunner::ScenarioRunner(const Scenario& scenario, HostOptions options, Console& console)
@@ -209,7 +214,7 @@ void ScenarioRunner::PlayTimeline() {
         AwaitCondition(entry);
         break;
       case TimelineEntry::Kind::kStop:
-        m_console.Note("stop (line " + std::to_string(entry.line) + ")");
+        m_console.Note("stop" + LineOf(entry));
         return;
     }
   }
@@ -231,8 +236,7 @@ void ScenarioRunner::SendAlarm(const TimelineEntry& entry) {
       ++(request.alarm.value_or(1) != 0 ? m_report.alarmStarts : m_report.alarmEnds);
     }
   }
-  m_console.Note(entry.label + " for " + ProfileList(entry.requests) + " (line " +
-                 std::to_string(entry.line) + ")");
+  m_console.Note(entry.label + " for " + ProfileList(entry.requests) + LineOf(entry));
   m_host->WriteDocument(BuildAlarmDocument(alarm), kAlarmSender);
 }
 
@@ -254,7 +258,7 @@ void ScenarioRunner::AwaitCondition(const TimelineEntry& entry) {
            (wait.profile ? " of profile " + std::to_string(*wait.profile) : "");
   }
   if (!wait.logText.empty()) what += (what.empty() ? "" : " and ") + ("\"" + wait.logText + "\"");
-  m_console.Note("waiting for " + what + " (line " + std::to_string(entry.line) + ")");
+  m_console.Note("waiting for " + what + LineOf(entry));
   const auto deadline = std::chrono::steady_clock::now() +
                         std::chrono::duration_cast<std::chrono::steady_clock::duration>(
                             std::chrono::duration<double>(wait.timeoutSeconds));
