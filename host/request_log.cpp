@@ -17,6 +17,7 @@ void RequestLog::Add(const hx::core::HostRequest& request) {
   {
     std::lock_guard<std::mutex> lock(m_mutex);
     m_requests.push_back(std::move(recorded));
+    ++m_generation;
   }
   m_signal.notify_all();
 }
@@ -38,11 +39,25 @@ std::vector<RecordedRequest> RequestLog::OfClass(uint32_t requestClass) const {
 void RequestLog::Clear() {
   std::lock_guard<std::mutex> lock(m_mutex);
   m_requests.clear();
+  ++m_generation;
 }
 
 bool RequestLog::WaitFor(const Predicate& predicate, std::chrono::milliseconds timeout) const {
+  // The predicate runs without the lock, on a copy, so that it may itself
+  // read this log (or anything that records into it) without deadlocking.
+  auto deadline = std::chrono::steady_clock::now() + timeout;
   std::unique_lock<std::mutex> lock(m_mutex);
-  return m_signal.wait_for(lock, timeout, [&] { return predicate(m_requests); });
+  for (;;) {
+    uint64_t seen = m_generation;
+    std::vector<RecordedRequest> snapshot = m_requests;
+    lock.unlock();
+    if (predicate(snapshot)) return true;
+    lock.lock();
+    if (!m_signal.wait_until(lock, deadline, [&] { return m_generation != seen; })) {
+      lock.unlock();
+      return predicate(Snapshot());
+    }
+  }
 }
 
 }  // namespace refhost

@@ -39,13 +39,16 @@ class RequestLog {
   void Clear();
 
   // Waits until `predicate` holds for the recorded requests, at most
-  // `timeout`. Returns whether it held. Wakes on every new request.
+  // `timeout`. Returns whether it held. Wakes on every new request. The
+  // predicate gets a copy and runs without the log's lock: it may read the
+  // log, the host's other records, or files.
   bool WaitFor(const Predicate& predicate, std::chrono::milliseconds timeout) const;
 
  private:
   mutable std::mutex m_mutex;
   mutable std::condition_variable m_signal;
   std::vector<RecordedRequest> m_requests;
+  uint64_t m_generation = 0;  // grows with every change
 };
 
 }  // namespace refhost

@@ -2,6 +2,7 @@
 
 #include <atomic>
 
+#include "alertmod/config/xml_document.h"
 #include "alertmod/platform/error_text.h"
 #include "alertmod/platform/files.h"
 
@@ -50,8 +51,26 @@ std::string WriteSideFile(const std::string& sideName, const std::string& text) 
 // reports an enormous one) would exhaust memory instead of failing.
 constexpr uint64_t kLargestXmlFileBytes = 64ull << 20;
 
+// Line ends become LF, as the XML library's own file loader makes them.
+std::string NormalizeLineEnds(const std::string& text) {
+  std::string normalized;
+  normalized.reserve(text.size());
+  for (size_t i = 0; i < text.size(); ++i) {
+    if (text[i] != '\r') {
+      normalized.push_back(text[i]);
+    } else {
+      normalized.push_back('\n');
+      if (i + 1 < text.size() && text[i + 1] == '\n') ++i;
+    }
+  }
+  return normalized;
+}
+
 bool LoadDocumentFile(TiXmlDocument& document, const std::string& name) {
-  return platform::IsRegularFileUpTo(name, kLargestXmlFileBytes) && document.LoadFile(name);
+  std::string text;
+  if (!platform::IsRegularFileUpTo(name, kLargestXmlFileBytes)) return false;
+  if (platform::ReadWholeFile(name, &text) != 0) return false;
+  return ParseXmlDocument(NormalizeLineEnds(text), document);
 }
 
 // A side file is adopted only when it holds a whole document: one cut short

@@ -1,4 +1,5 @@
 #include "alertmod/mail/templates.h"
+#include "alertmod/config/xml_document.h"
 
 #include <tinyxml.h>
 
@@ -132,8 +133,7 @@ std::string ExpandGroup(const std::string& group, int64_t eventTime) {
   if (start != std::string::npos) xml.append(group, start, std::string::npos);
   xml += " />";
   TiXmlDocument document;
-  document.Parse(xml.c_str());
-  const TiXmlElement* root = document.Error() ? nullptr : document.RootElement();
+  const TiXmlElement* root = ParseXmlDocument(xml, document) ? document.RootElement() : nullptr;
   if (root == nullptr) return std::string();
   if (root->ValueStr() == "date") return FormatDateElement(*root, eventTime, "%x");
   if (root->ValueStr() == "time") return FormatDateElement(*root, eventTime, "%X");

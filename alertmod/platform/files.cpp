@@ -65,5 +65,22 @@ bool IsRegularFileUpTo(const std::string& path, uint64_t maxBytes) {
          static_cast<uint64_t>(info.st_size) <= maxBytes;
 }
 
+int ReadWholeFile(const std::string& path, std::string* content) {
+  int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC);
+  if (fd < 0) return errno;
+  content->clear();
+  char buffer[65536];
+  for (;;) {
+    ssize_t n = read(fd, buffer, sizeof(buffer));
+    if (n < 0 && errno == EINTR) continue;
+    if (n <= 0) {
+      int error = n < 0 ? errno : 0;
+      close(fd);
+      return error;
+    }
+    content->append(buffer, static_cast<size_t>(n));
+  }
+}
+
 }  // namespace platform
 }  // namespace hx

@@ -40,6 +40,9 @@ int SyncParentDirectory(const std::string& path);
 // `maxBytes` bytes.
 bool IsRegularFileUpTo(const std::string& path, uint64_t maxBytes);
 
+// Reads the whole file `path` into `content`.
+int ReadWholeFile(const std::string& path, std::string* content);
+
 }  // namespace platform
 }  // namespace hx
 
