@@ -1,20 +1,29 @@
 #include "alertmod/mail/notification_job.h"
+#include "alertmod/video/clip_writer.h"
 
 namespace hx {
 namespace {
 
-// Stands in until the clip writer is wired: every attachment fails, so the
-// message goes out with the failure line in its body.
-class NoAttachmentWriter final : public IAttachmentWriter {
+// Writes attachments with the clip writer and the codec libraries it loads.
+class ClipAttachmentWriter final : public IAttachmentWriter {
  public:
-  bool WriteVideo(const VideoSource&, const std::string&) override { return false; }
-  bool WriteJpeg(const CVideoEmailStream&, const std::string&) override { return false; }
+  explicit ClipAttachmentWriter(core::HostCallbackFn callback) : m_callback(callback) {}
+
+  bool WriteVideo(const VideoSource& source, const std::string& path) override {
+    return WriteVideoAttachment(source.sourceKey, *source.stream, path, m_callback);
+  }
+  bool WriteJpeg(const CVideoEmailStream& stream, const std::string& path) override {
+    return WriteJpegAttachment(stream, path);
+  }
+
+ private:
+  core::HostCallbackFn m_callback;
 };
 
 }  // namespace
 
-std::unique_ptr<IAttachmentWriter> MakeAttachmentWriter(core::HostCallbackFn) {
-  return std::make_unique<NoAttachmentWriter>();
+std::unique_ptr<IAttachmentWriter> MakeAttachmentWriter(core::HostCallbackFn callback) {
+  return std::make_unique<ClipAttachmentWriter>(callback);
 }
 
 }  // namespace hx
