@@ -290,6 +290,22 @@ TEST_F(VideoCaptureTest, FrameBuffersGoBackOnceWhenTheirLastHolderLetsGo) {
   ExpectFramesReturned();
 }
 
+TEST_F(VideoCaptureTest, NotificationStillWaitingAtShutdownReturnsItsFrames) {
+  StartWith(NotifyFile({AttachProfile(1, 60)}));
+  refhost::SystemDescription system;
+  system.cameras = {Camera("Lobby", 1, refhost::kStandardH264)};
+  system.events = {{1, std::nullopt, EventSourceRef::Camera(kEncoders, 1, 0), {1}}};
+  SendSystem(system);
+  PushGop(Id(1), 10);
+  Alarm(CameraAlarm(1, 1));
+  PushGop(Id(1), 10);
+  ASSERT_EQ(State().pending, 1u);
+  // The capture and its notification hold each other; the module must still
+  // let both go when it is unloaded.
+  ExpectFramesReturned();
+  EXPECT_EQ(Items().size(), 0u);
+}
+
 // A real H.264 file, fed as fast as the module takes it, each frame one
 // frame interval later on the replaced clock.
 TEST_F(VideoCaptureTest, ClipOfARealCameraSpansThePreAlarmAndTheProfilesLength) {
