@@ -11,12 +11,16 @@
 
 #include <algorithm>
 #include <array>
+#include <atomic>
 #include <cstring>
 #include <memory>
+#include <string>
 #include <vector>
 
 #include "alertmod/platform/clock.h"
 #include "alertmod/video/video_buffer.h"
+#include "bench/manager_session.h"
+#include "host/system_description.h"
 
 namespace {
 
@@ -122,6 +126,94 @@ void BM_CopyingIntakeBaseline(benchmark::State& state) {
   state.SetItemsProcessed(state.iterations() * kStreams);
 }
 BENCHMARK(BM_CopyingIntakeBaseline)->MinTime(2.0);
+
+// The same load through the module's Write export from the reference host:
+// the frame-intake gate (catalogue, wanted streams, formats) in front of the
+// buffer, and 8 cameras raised by an alarm document every 100 rounds, whose
+// notifications attach the captures (the worker drops the finished items).
+constexpr int32_t kEncoders = 0x10000;
+constexpr int kAlarmEveryRounds = 100;
+
+uint32_t CameraStream(int camera) {
+  return refhost::HostStreamId(kEncoders, 1 + camera / 4, camera % 4, 0);
+}
+
+std::string CaptureNotifyFile() {
+  return "<Trellan><Notify ID=\"786432\"><Servers/><Profiles><smtp ID=\"1\" attach=\"1\" "
+         "description=\"Clips\" ThrottleSeconds=\"0\" from=\"a@b\" subject=\"s\" "
+         "MaxVideoSeconds=\"" +
+         std::to_string(kCaptureSeconds) +
+         "\" EventEdge=\"2\"><to>c@d</to></smtp></Profiles></Notify></Trellan>";
+}
+
+std::string CaptureSystem() {
+  refhost::SystemDescription site;
+  for (int i = 0; i < kStreams; ++i) {
+    refhost::CameraDescription camera{
+        "Camera " + std::to_string(i), kEncoders, 1 + i / 4, i % 4, {}};
+    camera.streams = {
+        refhost::StreamDescription{0, refhost::kStandardH264, 1920, 1080, std::nullopt}};
+    site.cameras.push_back(camera);
+    site.events.push_back(
+        {100 + i, kPreSeconds, refhost::EventSourceRef::Camera(kEncoders, 1 + i / 4, i % 4), {1}});
+  }
+  return refhost::BuildSystemDocument(site);
+}
+
+std::string CaptureAlarms() {
+  refhost::AlarmDocument alarm;
+  for (int i = 0; i < kCaptures; ++i) {
+    const int camera = i * (kStreams / kCaptures);
+    refhost::AlarmRequest request;
+    request.profile = 1;
+    request.action = 100 + camera;
+    request.source = refhost::AlarmRequest::Source{kEncoders, 1 + camera / 4, camera % 4, 0, 1};
+    alarm.requests.push_back(request);
+  }
+  return refhost::BuildAlarmDocument(alarm);
+}
+
+void BM_ZeroCopyIntakeThroughWrite(benchmark::State& state) {
+  std::atomic<uint64_t> released{0};
+  uint64_t kept = 0;
+  {
+    benchsupport::ManagerSession session(CaptureNotifyFile());
+    if (!session.Ready()) {
+      state.SkipWithError("the testing module could not be started");
+      return;
+    }
+    session.Host().SetHandler(hx::core::kClassFrameRelease, [&](hx::core::HostRequest&) {
+      released.fetch_add(1);
+      return 0;
+    });
+    session.Host().SendHostDocument(CaptureSystem());
+    const std::string alarms = CaptureAlarms();
+    const uint8_t* frame = SourceFrame();
+    session.OnDispatcher([&] {
+      uint64_t round = 0;
+      for (auto _ : state) {
+        session.AdvanceTick(kFrameIntervalMs);
+        for (int stream = 0; stream < kStreams; ++stream) {
+          hx::core::WriteParmsIn in{};
+          in.length = kFrameBytes;
+          in.data = frame;
+          in.source = CameraStream(stream);
+          in.requestClass = hx::core::kWriteClassFrame;
+          in.payloadOffset = kHeaderBytes;
+          in.frameType = (round + stream) % kKeySpacing == 0 ? hx::core::kFrameTypeKey : 0;
+          hx::core::WriteParmsOut out{};
+          session.Host().Write(in, &out);
+          kept += out.frameKept;
+        }
+        if (++round % kAlarmEveryRounds == 0) session.Host().WriteDocument(alarms, kEncoders);
+      }
+    });
+  }
+  if (released.load() != kept) state.SkipWithError("frame buffers were not all returned");
+  state.SetItemsProcessed(state.iterations() * kStreams);
+  state.counters["kept"] = static_cast<double>(kept);
+}
+BENCHMARK(BM_ZeroCopyIntakeThroughWrite)->MinTime(2.0)->UseRealTime();
 
 }  // namespace
 

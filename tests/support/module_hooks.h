@@ -98,6 +98,11 @@ using WorkItemRecorderFn = void (*)(const WorkItemRecord& record, void* context)
 // without a manager.
 using SetWorkItemRecorderFn = bool (*)(WorkItemRecorderFn recorder, void* context);
 
+// "SetWorkerDropsItems": makes the live manager's worker drop every item
+// unsent (for benchmarks). Call after Load and before the worker thread is
+// lent. False without a manager.
+using SetWorkerDropsItemsFn = bool (*)();
+
 // The live manager's host-side state.
 struct ManagerStateRecord {
   size_t pending = 0;

@@ -92,6 +92,25 @@ bool SetWorkItemRecorder(WorkItemRecorderFn recorder, void* context) {
   return true;
 }
 
+// A worker that lets every item go unsent, for measurements of the host-side
+// paths without the cost of mail.
+class DroppingJob final : public hx::IWorkerJob {
+ public:
+  void Start(const hx::WorkerSettings&) override {}
+  bool HasPendingRetries() const override { return false; }
+  void OnConfigurationChanged(const hx::WorkerSettings&) override {}
+  void Run(hx::NotifyWorkItem&) override {}
+  void RetryPass() override {}
+  void Stop() override {}
+};
+
+bool SetWorkerDropsItems() {
+  hx::NotifyManager* manager = hx::CurrentManager();
+  if (manager == nullptr) return false;
+  manager->SetWorkerJobFactory([] { return std::make_unique<DroppingJob>(); });
+  return true;
+}
+
 void RecordWanted(const hx::NotifyManager& manager, ManagerStateRecord& state) {
   const hx::WantedVideo& wanted = manager.Wanted();
   state.videoSources.assign(wanted.Sources().begin(), wanted.Sources().end());
@@ -120,6 +139,7 @@ bool GetManagerState(ManagerStateRecord& state) {
 
 HookRegistrar g_recorder("SetWorkItemRecorder", AsHook(&SetWorkItemRecorder));
 HookRegistrar g_state("GetManagerState", AsHook(&GetManagerState));
+HookRegistrar g_dropping("SetWorkerDropsItems", AsHook(&SetWorkerDropsItems));
 
 }  // namespace
 }  // namespace testhooks
