@@ -290,6 +290,24 @@ TEST_F(VideoCaptureTest, FrameBuffersGoBackOnceWhenTheirLastHolderLetsGo) {
   ExpectFramesReturned();
 }
 
+TEST_F(VideoCaptureTest, NotificationIsSentWhenItsCameraLeavesTheDescription) {
+  StartWith(NotifyFile({AttachProfile(1, 60)}));
+  refhost::SystemDescription system;
+  system.cameras = {Camera("Lobby", 1, refhost::kStandardH264)};
+  system.events = {{1, std::nullopt, EventSourceRef::Camera(kEncoders, 1, 0), {1}}};
+  SendSystem(system);
+  PushGop(Id(1), 10);
+  Alarm(CameraAlarm(1, 1));
+  ASSERT_EQ(State().pending, 1u);
+  // No more video can come; the clip holds what it has and goes at once.
+  system.events[0].notifyProfiles.clear();
+  SendSystem(system);
+  ASSERT_TRUE(WaitForItems(1, seconds(10)));
+  EXPECT_TRUE(Items()[0].videoSources.at(0).done);
+  EXPECT_EQ(Items()[0].videoSources.at(0).frames, 10u);
+  EXPECT_EQ(State().pending + State().ready, 0u);
+}
+
 TEST_F(VideoCaptureTest, NotificationStillWaitingAtShutdownReturnsItsFrames) {
   StartWith(NotifyFile({AttachProfile(1, 60)}));
   refhost::SystemDescription system;
