@@ -53,6 +53,17 @@ AlarmRequest CameraAlarm(int32_t profile, int32_t device, int32_t action = 0) {
 
 class VideoCaptureTest : public managertest::ManagerHostTest {
  protected:
+  // Starts with one attaching profile and the Lobby camera (device 1), whose
+  // event 7 notifies it.
+  refhost::SystemDescription StartWithLobby(int32_t maxVideoSeconds,
+                                            std::optional<int32_t> preAlarmSeconds = {}) {
+    StartWith(NotifyFile({AttachProfile(1, maxVideoSeconds)}));
+    refhost::SystemDescription system;
+    system.cameras = {Camera("Lobby", 1, refhost::kStandardH264)};
+    system.events = {{7, preAlarmSeconds, EventSourceRef::Camera(kEncoders, 1, 0), {1}}};
+    SendSystem(system);
+    return system;
+  }
   void Alarm(const AlarmRequest& request) {
     refhost::AlarmDocument document;
     document.requests = {request};
@@ -199,11 +210,7 @@ TEST_F(VideoCaptureTest, SourceGroupCapturesEveryMemberCamera) {
 }
 
 TEST_F(VideoCaptureTest, CameraWithoutBufferedVideoIsSentAtOnceWithoutIt) {
-  StartWith(NotifyFile({AttachProfile(1, 10)}));
-  refhost::SystemDescription system;
-  system.cameras = {Camera("Lobby", 1, refhost::kStandardH264)};
-  system.events = {{1, std::nullopt, EventSourceRef::Camera(kEncoders, 1, 0), {1}}};
-  SendSystem(system);
+  StartWithLobby(10);
   Alarm(CameraAlarm(1, 1));
   Alarm(CameraAlarm(1, 9));  // a camera the host never described
   ASSERT_TRUE(WaitForItems(2, seconds(10)));
@@ -291,11 +298,7 @@ TEST_F(VideoCaptureTest, FrameBuffersGoBackOnceWhenTheirLastHolderLetsGo) {
 }
 
 TEST_F(VideoCaptureTest, NotificationIsSentWhenItsCameraLeavesTheDescription) {
-  StartWith(NotifyFile({AttachProfile(1, 60)}));
-  refhost::SystemDescription system;
-  system.cameras = {Camera("Lobby", 1, refhost::kStandardH264)};
-  system.events = {{1, std::nullopt, EventSourceRef::Camera(kEncoders, 1, 0), {1}}};
-  SendSystem(system);
+  refhost::SystemDescription system = StartWithLobby(60);
   PushGop(Id(1), 10);
   Alarm(CameraAlarm(1, 1));
   ASSERT_EQ(State().pending, 1u);
@@ -309,11 +312,7 @@ TEST_F(VideoCaptureTest, NotificationIsSentWhenItsCameraLeavesTheDescription) {
 }
 
 TEST_F(VideoCaptureTest, NotificationStillWaitingAtShutdownReturnsItsFrames) {
-  StartWith(NotifyFile({AttachProfile(1, 60)}));
-  refhost::SystemDescription system;
-  system.cameras = {Camera("Lobby", 1, refhost::kStandardH264)};
-  system.events = {{1, std::nullopt, EventSourceRef::Camera(kEncoders, 1, 0), {1}}};
-  SendSystem(system);
+  StartWithLobby(60);
   PushGop(Id(1), 10);
   Alarm(CameraAlarm(1, 1));
   PushGop(Id(1), 10);
@@ -333,11 +332,7 @@ TEST_F(VideoCaptureTest, ClipOfARealCameraSpansThePreAlarmAndTheProfilesLength) 
       "-c:v libx264 -pix_fmt yuv420p -x264-params keyint=25:min-keyint=25:scenecut=0 '" +
       path + "'";
   ASSERT_EQ(0, std::system(command.c_str())) << "ffmpeg is needed for this test: " << command;
-  StartWith(NotifyFile({AttachProfile(1, 10)}));
-  refhost::SystemDescription system;
-  system.cameras = {Camera("Lobby", 1, refhost::kStandardH264)};
-  system.events = {{7, 5, EventSourceRef::Camera(kEncoders, 1, 0), {1}}};
-  SendSystem(system);
+  StartWithLobby(10, 5);
 
   constexpr uint64_t kAlarmFrame = 300;  // 12 s into the file
   constexpr uint32_t kFrameMs = 40;

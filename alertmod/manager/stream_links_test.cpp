@@ -4,6 +4,8 @@
 #include <tinyxml.h>
 
 #include <optional>
+#include <set>
+#include <utility>
 #include <vector>
 
 #include "alertmod/manager/event_source_key.h"
@@ -53,17 +55,26 @@ HostSystemCatalogue MakeCatalogue() {
   return catalogue;
 }
 
-TEST(StreamLinksTest, CompressedSourcesAreLinkedToTheirSmallestNumberedStill) {
+class StreamLinksTest : public ::testing::Test {
+ protected:
+  // Wants `sources` and links them.
+  void Want(std::set<uint32_t> sources) {
+    wanted.MutableSources() = std::move(sources);
+    RelinkStreams(wanted, catalogue, buffer);
+  }
+
   testsupport::FakeHost host;
   HostSystemCatalogue catalogue = MakeCatalogue();
-  VideoBuffer buffer(host.callback());
+  VideoBuffer buffer{host.callback()};
   WantedVideo wanted;
+};
+
+TEST_F(StreamLinksTest, CompressedSourcesAreLinkedToTheirSmallestNumberedStill) {
   const uint32_t unknown = Id(9, 0);
-  wanted.MutableSources() = {Id(1, 0), Id(2, 0), Id(3, 15), Id(4, 0), Id(5, 0, 1), unknown};
   static const char frame[100] = {};
   ASSERT_TRUE(
       buffer.AddFrame(static_cast<int32_t>(unknown), kKeyFrameType, 0, frame, 100, StreamFormat{}));
-  RelinkStreams(wanted, catalogue, buffer);
+  Want({Id(1, 0), Id(2, 0), Id(3, 15), Id(4, 0), Id(5, 0, 1), unknown});
 
   std::vector<std::pair<uint32_t, int32_t>> links;
   for (const auto& link : wanted.Links()) links.emplace_back(link.first, link.second.ID);
@@ -88,13 +99,8 @@ TEST(StreamLinksTest, CompressedSourcesAreLinkedToTheirSmallestNumberedStill) {
   for (const Want& w : wants) EXPECT_EQ(wanted.Wants(w.key), w.wanted) << std::hex << w.key;
 }
 
-TEST(StreamLinksTest, StreamsNoLongerDescribedOrWantedLeaveTheBuffer) {
-  testsupport::FakeHost host;
-  HostSystemCatalogue catalogue = MakeCatalogue();
-  VideoBuffer buffer(host.callback());
-  WantedVideo wanted;
-  wanted.MutableSources() = {Id(1, 0), Id(2, 0)};
-  RelinkStreams(wanted, catalogue, buffer);
+TEST_F(StreamLinksTest, StreamsNoLongerDescribedOrWantedLeaveTheBuffer) {
+  Want({Id(1, 0), Id(2, 0)});
   static const char frame[100] = {};
   for (uint32_t id : {Id(1, 0), Id(1, 0, 2), Id(2, 0), Id(4, 0), Id(8, 0)}) {
     buffer.AddFrame(static_cast<int32_t>(id), kKeyFrameType, 0, frame, 100, StreamFormat{});
@@ -106,13 +112,8 @@ TEST(StreamLinksTest, StreamsNoLongerDescribedOrWantedLeaveTheBuffer) {
                                         static_cast<int32_t>(Id(1, 0, 2))}));
 }
 
-TEST(StreamLinksTest, SourcesMapToTheirLinkedOrOwnStream) {
-  testsupport::FakeHost host;
-  HostSystemCatalogue catalogue = MakeCatalogue();
-  VideoBuffer buffer(host.callback());
-  WantedVideo wanted;
-  wanted.MutableSources() = {Id(1, 0), Id(2, 0)};
-  RelinkStreams(wanted, catalogue, buffer);
+TEST_F(StreamLinksTest, SourcesMapToTheirLinkedOrOwnStream) {
+  Want({Id(1, 0), Id(2, 0)});
   const char kWarning[] = "Unable to map video input to stream/ channel id to locate video frame";
   EXPECT_EQ(MapSourceToStream(Id(1, 0), catalogue, wanted, host.callback()),
             static_cast<int32_t>(Id(1, 0, 2)));
@@ -124,7 +125,7 @@ TEST(StreamLinksTest, SourcesMapToTheirLinkedOrOwnStream) {
   EXPECT_EQ(host.LogTexts(50), std::vector<std::string>{kWarning});
 }
 
-TEST(StreamLinksTest, StreamFormatIsTheRecordFieldForField) {
+TEST(StreamFormatTest, IsTheCataloguesRecordFieldForField) {
   const StreamFormatRecord record{0x10100, 2, 640, 480, kH264};
   const StreamFormat format = ToStreamFormat(record);
   EXPECT_EQ(format.lead0, 0x10100u);
