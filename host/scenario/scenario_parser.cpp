@@ -233,13 +233,17 @@ class Parser {
     if (name) m_result.scenario.serverDescription = name;
   }
 
-  std::optional<int32_t> PluginValue(Directive& d, int32_t fallback) {
-    std::optional<int32_t> plugin = d.Integer("plugin", 0, 0xFF0000);
-    if (plugin && (*plugin & 0xFFFF) != 0) {
+  // The plug-in and device numbers of a camera, trigger or device line,
+  // keeping the given defaults when absent. False when either is faulty.
+  bool ReadDevice(Directive& d, int32_t* plugin, int32_t* device) {
+    std::optional<int32_t> givenPlugin = d.Integer("plugin", 0, 0xFF0000);
+    if (givenPlugin && (*givenPlugin & 0xFFFF) != 0) {
       d.Fault("plugin must be a multiple of 0x10000");
-      return std::nullopt;
+      givenPlugin.reset();
     }
-    return plugin.value_or(fallback);
+    *plugin = givenPlugin.value_or(*plugin);
+    *device = d.Integer("device", 0, kByteMax).value_or(*device);
+    return !d.failed();
   }
 
   void Plugin(Directive& d) {
@@ -254,13 +258,11 @@ class Parser {
   void Device(Directive& d) {
     DeviceDescription device;
     std::optional<std::string> name = d.Word(0, "device name");
-    std::optional<int32_t> plugin = PluginValue(d, device.plugin);
-    device.device = d.Integer("device", 0, kByteMax).value_or(device.device);
+    ReadDevice(d, &device.plugin, &device.device);
     device.serial = d.Text("serial");
     d.Finish(1);
     if (d.failed()) return;
     device.name = *name;
-    device.plugin = *plugin;
     m_result.scenario.system.devices.push_back(device);
   }
 
@@ -297,14 +299,12 @@ class Parser {
   void Camera(Directive& d) {
     CameraSpec camera;
     std::optional<std::string> name = d.Word(0, "camera name");
-    std::optional<int32_t> plugin = PluginValue(d, camera.plugin);
-    camera.device = d.Integer("device", 0, kByteMax).value_or(camera.device);
+    ReadDevice(d, &camera.plugin, &camera.device);
     camera.input = d.Integer("input", 0, kByteMax).value_or(camera.input);
     camera.streams.push_back(ReadStream(d, 0));
     d.Finish(1);
     if (d.failed() || !NameIsFree(d, *name)) return;
     camera.name = *name;
-    camera.plugin = *plugin;
     camera.line = m_line;
     for (const CameraSpec& other : m_result.scenario.cameras) {
       if (other.plugin == camera.plugin && other.device == camera.device &&
@@ -344,14 +344,12 @@ class Parser {
   void Trigger(Directive& d) {
     TriggerDescription trigger;
     std::optional<std::string> name = d.Word(0, "trigger name");
-    std::optional<int32_t> plugin = PluginValue(d, trigger.plugin);
-    trigger.device = d.Integer("device", 0, kByteMax).value_or(trigger.device);
+    ReadDevice(d, &trigger.plugin, &trigger.device);
     trigger.number = d.Integer("number", 0, kByteMax).value_or(trigger.number);
     trigger.output = d.Flag("output").value_or(false);
     d.Finish(1);
     if (d.failed() || !NameIsFree(d, *name)) return;
     trigger.name = *name;
-    trigger.plugin = *plugin;
     m_triggers[trigger.name] = m_result.scenario.system.triggers.size();
     m_result.scenario.system.triggers.push_back(trigger);
   }
