@@ -207,7 +207,7 @@ std::string MakeCameraFile(const TempDir& dir) {
   return path;
 }
 
-TEST(HostCliTest, ScenarioWithACameraFeedReturnsEveryFrameBuffer) {
+TEST(HostCliTest, ScenarioWithACameraFeedMailsAClipAndReturnsEveryFrameBuffer) {
   SmtpTestServer smtp;
   TempDir dir;
   const std::string camera = MakeCameraFile(dir);
@@ -226,6 +226,7 @@ TEST(HostCliTest, ScenarioWithACameraFeedReturnsEveryFrameBuffer) {
   EXPECT_EQ(outcome.status, 0) << outcome.all();
   for (const char* line :
        {"Alarms sent:     1 start, 0 ends, 0 tests", "Status reports:  1 delivered, 0 failed",
+        "Attachments:     1 clip, 0 stills, 0 failed",
         "Lobby (stream 65792, H.264 320x240):", "all returned", "Result:          OK"}) {
     EXPECT_TRUE(Has(outcome.out, line)) << line << "\n" << outcome.all();
   }
@@ -235,6 +236,7 @@ TEST(HostCliTest, ScenarioWithACameraFeedReturnsEveryFrameBuffer) {
   EXPECT_TRUE(Has(outcome.err, "event source (Lobby)")) << outcome.all();
   ASSERT_TRUE(smtp.WaitForMessages(1));
   EXPECT_TRUE(Has(smtp.Messages()[0].data, "Subject: Lobby")) << smtp.Messages()[0].data;
+  EXPECT_TRUE(Has(smtp.Messages()[0].data, "video/quicktime")) << "the clip goes with the e-mail";
 }
 
 }  // namespace

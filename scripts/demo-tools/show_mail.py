@@ -14,6 +14,7 @@ import binascii
 import email
 import email.policy
 import json
+import math
 import os
 import re
 import subprocess
@@ -42,6 +43,7 @@ def link_search(link):
 
 
 def describe_clip(path):
+    """(seconds, description) of a clip, or None when ffprobe cannot read it."""
     command = ["ffprobe", "-v", "error", "-select_streams", "v:0", "-count_frames",
                "-show_entries", "stream=codec_name,width,height,nb_read_frames:format=duration",
                "-of", "json", path]
@@ -50,14 +52,20 @@ def describe_clip(path):
         return None
     info = json.loads(result.stdout)
     stream = info["streams"][0]
-    return "%s %sx%s, %s frames, %.1f s" % (stream["codec_name"], stream["width"],
-                                            stream["height"], stream.get("nb_read_frames", "?"),
-                                            float(info["format"].get("duration", 0)))
+    seconds = float(info["format"].get("duration", 0))
+    return seconds, "%s %sx%s, %s frames, %.1f s" % (
+        stream["codec_name"], stream["width"], stream["height"],
+        stream.get("nb_read_frames", "?"), seconds)
 
 
-def contact_sheet(clip, png):
+def contact_sheet(clip, seconds, png):
+    """One frame a second, four to a row."""
+    frames = max(1, math.ceil(seconds))
+    columns = min(frames, 4)
+    rows = math.ceil(frames / columns)
     command = ["ffmpeg", "-v", "error", "-y", "-i", clip, "-vf",
-               "fps=1,scale=320:-1,tile=4x2:padding=4:margin=4", "-frames:v", "1", png]
+               "fps=1,scale=320:-1,tile=%dx%d:padding=4:margin=4" % (columns, rows),
+               "-frames:v", "1", png]
     return subprocess.run(command).returncode == 0 and os.path.exists(png)
 
 
@@ -72,13 +80,14 @@ def show_attachment(number, index, part, out):
                                                saved))
     if not name.lower().endswith(VIDEO_SUFFIXES):
         return True
-    description = describe_clip(saved)
-    if description is None:
+    described = describe_clip(saved)
+    if described is None:
         print("      the clip cannot be read")
         return False
+    seconds, description = described
     print("      clip: %s" % description)
     sheet = os.path.splitext(saved)[0] + "-contact-sheet.png"
-    if contact_sheet(saved, sheet):
+    if contact_sheet(saved, seconds, sheet):
         print("      contact sheet: %s" % sheet)
     return True
 
