@@ -9,6 +9,7 @@
 #include <sstream>
 
 #include "host/scenario/scenario_directive.h"
+#include "host/scenario/scenario_vocabulary.h"
 
 namespace refhost::scenario {
 namespace {
@@ -20,98 +21,19 @@ constexpr int32_t kMaxSizeLimitMb = 2047;
 constexpr int32_t kMaxPictureSide = 16384;
 constexpr char kTestMessage[] = "Testing Profile";
 
-template <typename Code>
-struct NamedCode {
-  const char* name;
-  Code code;
-};
-
-// The host's event type codes by the names a scenario uses.
-constexpr NamedCode<int32_t> kEventTypes[] = {
-    {"video-loss", 1},
-    {"motion", 2},
-    {"input", 3},
-    {"pos-port", 4},
-    {"pos-profile", 5},
-    {"button", 6},
-    {"temperature", 7},
-    {"storage", 8},
-    {"ip-connection", 9},
-    {"record-content-age", 10},
-    {"archive-content-age", 11},
-    {"source-group", 12},
-    {"power-supply", 13},
-    {"outbound-connection", 14},
-    {"security-integrations-health", 15},
-    {"soft-trigger", 16},
-    {"license", 17},
-    {"analytic", 18},
-    {"device-failure", 19},
-    {"audio-connection", 20},
-    {"device-connection", 21},
-    {"throttle", 22},
-    {"fan", 23},
-    {"time-trigger", 24},
-    {"hardware-temperature", 25},
-    {"hardware-fan", 26},
-    {"hardware-voltage", 27},
-    {"archive-connection", 28},
-    {"archive-task", 29},
-    {"security-integration-connection", 30},
-    {"security-integration-alarm", 31},
-    {"security-integration-alert", 32},
-    {"serial-port-connection", 33},
-    {"record-alarm", 34},
-    {"thinning", 35},
-};
-constexpr int32_t kMotion = 2;
-constexpr int32_t kInputTrigger = 3;
-constexpr int32_t kSourceGroupType = 12;
-
-constexpr NamedCode<int32_t> kCodecs[] = {
-    {"jpeg", kStandardJpeg}, {"mjpeg", kStandardJpeg}, {"mpeg4", kStandardMpeg4},
-    {"h264", kStandardH264}, {"h265", kStandardH265},  {"hevc", kStandardH265},
-};
-constexpr NamedCode<int32_t> kSecurityModes[] = {{"plain", 0}, {"smtps", 1}, {"starttls", 2}};
-constexpr NamedCode<int32_t> kEdges[] = {{"start", 0}, {"end", 1}, {"both", 2}};
-
-template <typename Code, size_t N>
-std::optional<Code> Lookup(const NamedCode<Code> (&table)[N], const std::string& name) {
-  for (const NamedCode<Code>& entry : table) {
-    if (name == entry.name) return entry.code;
-  }
-  return std::nullopt;
-}
-
-template <typename Code, size_t N>
-std::string Names(const NamedCode<Code> (&table)[N]) {
-  std::string names;
-  for (const NamedCode<Code>& entry : table)
-    names += (names.empty() ? "" : ", ") + std::string(entry.name);
-  return names;
-}
-
-// A code from a table by name, or a number when `numbers` allows it.
-template <size_t N>
-std::optional<int32_t> NamedValue(Directive& d, const char* key,
-                                  const NamedCode<int32_t> (&table)[N], bool numbers) {
+// A code of `vocabulary` by its word, or a number when `numbers` allows it.
+std::optional<int32_t> NamedValue(Directive& d, const char* key, Vocabulary vocabulary,
+                                  bool numbers) {
   std::optional<std::string> text = d.Text(key);
   if (!text) return std::nullopt;
-  if (std::optional<int32_t> code = Lookup(table, *text)) return code;
+  if (std::optional<int32_t> code = CodeOf(vocabulary, *text)) return code;
   int64_t number = 0;
   if (numbers && ParseInteger(*text, &number) && number >= INT32_MIN && number <= INT32_MAX) {
     return static_cast<int32_t>(number);
   }
-  d.Fault(std::string(key) + " must be one of " + Names(table) + (numbers ? " or a number" : "") +
-          ", not \"" + *text + "\"");
+  d.Fault(std::string(key) + " must be one of " + WordsOf(vocabulary) +
+          (numbers ? " or a number" : "") + ", not \"" + *text + "\"");
   return std::nullopt;
-}
-
-std::string TypeName(int32_t code) {
-  for (const NamedCode<int32_t>& entry : kEventTypes) {
-    if (entry.code == code) return entry.name;
-  }
-  return "type " + std::to_string(code);
 }
 
 // Seconds as "2", "2.5" or "2.5s".
@@ -273,7 +195,7 @@ class Parser {
     stream.description.context = context;
     if (std::optional<std::string> feed = d.Text("feed")) stream.feed = ResolvePath(*feed);
     stream.formatGiven = d.Has("codec") || d.Has("width") || d.Has("height");
-    std::optional<int32_t> codec = NamedValue(d, "codec", kCodecs, false);
+    std::optional<int32_t> codec = NamedValue(d, "codec", Vocabulary::kCodec, false);
     stream.description.standard = codec.value_or(stream.description.standard);
     stream.description.width =
         d.Integer("width", 1, kMaxPictureSide).value_or(stream.description.width);
@@ -436,7 +358,7 @@ class Parser {
   void Event(Directive& d) {
     std::optional<int32_t> id = d.IntegerWord(0, "event number", 1, kMaxId);
     std::optional<SourceRef> source = ReadSource(d);
-    std::optional<int32_t> type = NamedValue(d, "type", kEventTypes, true);
+    std::optional<int32_t> type = NamedValue(d, "type", Vocabulary::kEventType, true);
     std::optional<int32_t> preAlarm = d.Integer("prealarm", 0, 3600);
     std::vector<int32_t> profiles = d.IntegerList("notify", 1, kMaxId);
     d.Finish(1);
@@ -500,7 +422,7 @@ class Parser {
     std::optional<std::string> address = d.Text("address");
     if (!address) d.Fault("smtp needs address=");
     server.port = d.Integer("port", 1, 65535);
-    server.security = NamedValue(d, "security", kSecurityModes, true);
+    server.security = NamedValue(d, "security", Vocabulary::kSecurity, true);
     server.user = d.Text("user").value_or("");
     server.password = d.Text("password").value_or("");
     d.Finish(1);
@@ -525,7 +447,7 @@ class Parser {
     if (std::optional<std::string> body = d.Text("body")) profile.bodyLines.push_back(*body);
     profile.attach = d.Flag("attach");
     profile.maxVideoSeconds = d.Integer("video-seconds", 0, 3600);
-    profile.eventEdge = NamedValue(d, "edge", kEdges, false);
+    profile.eventEdge = NamedValue(d, "edge", Vocabulary::kEdge, false);
     profile.throttleSeconds = d.Integer("throttle", 0, kMaxId);
     d.Finish(2);
     ConfigSpec& config = InlineConfig(d);
@@ -616,16 +538,16 @@ class Parser {
   }
 
   std::optional<int32_t> AlarmType(Directive& d, const SourceRef& source, const EventInfo* event) {
-    std::optional<int32_t> type = NamedValue(d, "type", kEventTypes, true);
+    std::optional<int32_t> type = NamedValue(d, "type", Vocabulary::kEventType, true);
     if (type) return type;
     if (event != nullptr && event->type) return event->type;
     switch (source.kind) {
       case SourceRef::Kind::kCamera:
-        return kMotion;
+        return kEventTypeMotion;
       case SourceRef::Kind::kTrigger:
-        return kInputTrigger;
+        return kEventTypeInput;
       case SourceRef::Kind::kGroup:
-        return kSourceGroupType;
+        return kEventTypeSourceGroup;
       case SourceRef::Kind::kSystem:
         break;
     }
@@ -640,8 +562,9 @@ class Parser {
       request.group = source.input;
       for (const SourceRef& member : m_groups.at(source.input)) {
         const bool camera = member.kind == SourceRef::Kind::kCamera;
-        request.groupMembers.push_back(AlarmRequest::Source{
-            member.plugin, member.device, member.input, 0, camera ? kMotion : kInputTrigger});
+        request.groupMembers.push_back(
+            AlarmRequest::Source{member.plugin, member.device, member.input, 0,
+                                 camera ? kEventTypeMotion : kEventTypeInput});
       }
       return request;
     }
@@ -675,7 +598,7 @@ class Parser {
       request.message = message;
       entry->requests.push_back(request);
     }
-    entry->label = "alarm " + *edge + ", " + TypeName(type) +
+    entry->label = "alarm " + *edge + ", " + WordOf(Vocabulary::kEventType, type) +
                    (source->name.empty() ? "" : " on " + source->name) +
                    (eventId ? ", event " + std::to_string(*eventId) : "");
   }
@@ -774,15 +697,6 @@ ParseResult LoadScenario(const std::string& path, const VariableLookup& variable
 std::string FormatDiagnostic(const std::string& name, const Diagnostic& diagnostic) {
   if (diagnostic.line == 0) return name + ": " + diagnostic.message;
   return name + ":" + std::to_string(diagnostic.line) + ": " + diagnostic.message;
-}
-
-std::optional<int32_t> EventTypeCode(const std::string& name) {
-  if (std::optional<int32_t> code = Lookup(kEventTypes, name)) return code;
-  int64_t number = 0;
-  if (ParseInteger(name, &number) && number >= INT32_MIN && number <= INT32_MAX) {
-    return static_cast<int32_t>(number);
-  }
-  return std::nullopt;
 }
 
 }  // namespace refhost::scenario

@@ -47,10 +47,6 @@ ParseResult LoadScenario(const std::string& path, const VariableLookup& variable
 // "name:line: message" (or "name: message" for line 0).
 std::string FormatDiagnostic(const std::string& name, const Diagnostic& diagnostic);
 
-// The host's event type code for a name of the scenario vocabulary
-// ("motion", "storage", ...) or a decimal number; nothing when unknown.
-std::optional<int32_t> EventTypeCode(const std::string& name);
-
 }  // namespace refhost::scenario
 
 #endif  // ALERTMOD_HOST_SCENARIO_SCENARIO_PARSER_H_
