@@ -137,8 +137,8 @@ bool ScenarioRunner::OpenFeeds() {
   }
   for (const RawFeed& raw : m_scenario.rawFeeds) {
     FeedFormat format;
-    if (!OpenFeed("stream " + std::to_string(raw.streamId), raw.streamId, raw.path, raw.realTime,
-                  &format)) {
+    const std::string label = raw.path.substr(raw.path.find_last_of('/') + 1);
+    if (!OpenFeed(label, raw.streamId, raw.path, raw.realTime, &format)) {
       return false;
     }
   }
