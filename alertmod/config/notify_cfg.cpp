@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cctype>
+#include <limits>
 
 #include <tinyxml.h>
 
@@ -212,7 +213,10 @@ bool NotifyCfg::ReadProfile(const TiXmlElement& smtp, int32_t& next, const Confi
   std::optional<int32_t> id = IntAttribute(smtp, "ID");
   if (!id) return false;
   // An automatic identifier is spent even when the profile is then skipped.
-  profile.id = *id != 0 ? *id : next++;
+  // The counter stops at the largest identifier instead of overflowing (an
+  // "autoincrement" of 2147483647 comes only from a host that sent it).
+  profile.id = *id != 0 ? *id : next;
+  if (*id == 0 && next < std::numeric_limits<int32_t>::max()) ++next;
   if (!HasRequiredProfileParts(smtp)) return false;
   const NotifyProfile* previous = FindProfile(profile.id);
   if (std::optional<int32_t> attach = IntAttribute(smtp, "attach")) {

@@ -4,6 +4,7 @@
 #include <tinyxml.h>
 
 #include <climits>
+#include <limits>
 #include <string>
 #include <vector>
 
@@ -258,7 +259,11 @@ TEST_F(NotifyCfgTest, AutomaticIdentifiersFollowTheLargerCounter) {
     std::vector<int32_t> ids;
     int32_t counterAfter;
   };
-  const Case cases[] = {{1, {3, 7, 8}, 9}, {10, {3, 10, 11}, 12}};
+  // The counter stops at the largest identifier: the second automatic
+  // profile then replaces the first, and nothing overflows.
+  constexpr int32_t kLargest = std::numeric_limits<int32_t>::max();
+  const Case cases[] = {
+      {1, {3, 7, 8}, 9}, {10, {3, 10, 11}, 12}, {kLargest, {3, kLargest}, kLargest}};
   for (const Case& c : cases) {
     NotifyCfg config;
     ASSERT_TRUE(ParseNotify(
