@@ -91,6 +91,21 @@ void SetState(client& process, int32_t state) {
   process.state = state;
 }
 
+// Gives up a run whose input the host refused: the program would wait for
+// the end of its input, and its caller with it, until Close. The id is
+// forgotten, so that anything the host still sends for it is dropped.
+// Returns false when the run has ended meanwhile and its result stands.
+bool Abandon(const std::shared_ptr<client>& process) {
+  ProcessRegistry& registry = ProcessRegistry::Instance();
+  std::lock_guard<std::mutex> lock(registry.lock);
+  std::lock_guard<std::mutex> clientLock(process->lock);
+  if (process->state == kStateExited) return false;
+  auto found = registry.clients.find(process->id);
+  if (found != registry.clients.end() && found->second == process) registry.clients.erase(found);
+  process->state = kStateFailed;
+  return true;
+}
+
 }  // namespace
 
 void RegisterProcessService(uint32_t moduleId, SendFunction send) {
@@ -251,12 +266,14 @@ bool RunProcess(const std::vector<std::string>& arguments, const std::string& in
     if (process->state == kStateFailed) return false;
     process->endInputAtWait = false;
   }
-  SendProcessMessage(process->id, core::kProcessInput, 1, input.data(), input.size());
+  bool inputSent =
+      SendProcessMessage(process->id, core::kProcessInput, 1, input.data(), input.size());
   // The host ends the program's input at a message shorter than the
   // maximum; input filling whole messages needs one more, empty.
-  if (!input.empty() && input.size() % kMaxPayloadBytes == 0) {
-    SendProcessMessage(process->id, core::kProcessInput, 1, nullptr, 0);
+  if (inputSent && !input.empty() && input.size() % kMaxPayloadBytes == 0) {
+    inputSent = SendProcessMessage(process->id, core::kProcessInput, 1, nullptr, 0);
   }
+  if (!inputSent && Abandon(process)) return false;
   std::string line;
   while (ReadOutputLine(*process, line, 1)) errorLines.push_back(line);
   WaitForExit(*process);

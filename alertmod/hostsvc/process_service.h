@@ -106,7 +106,9 @@ void WaitForExit(client& process);
 // its length is a multiple of the message payload) and collects its error
 // output as lines and, when `output` is given, its standard output. True with
 // the exit code when the program ran to its end; false when it could not be
-// started or its run was cut off by Close.
+// started, when the host refused its input (the run is then given up: the
+// program would wait for the end of its input) or when its run was cut off
+// by Close.
 bool RunProcess(const std::vector<std::string>& arguments, const std::string& input,
                 int32_t& exitCode, std::vector<std::string>& errorLines,
                 std::string* output = nullptr);

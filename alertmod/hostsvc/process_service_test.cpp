@@ -282,6 +282,31 @@ TEST_F(ProcessServiceTest, RunProcessAlwaysEndsTheInput) {
   }
 }
 
+// A host that takes the start and refuses the input: a program still
+// running would never see its input end, so the run is given up at once; one
+// that has already exited keeps its result.
+TEST_F(ProcessServiceTest, RunProcessGivesUpWhenTheHostRefusesTheInput) {
+  struct Case {
+    uint32_t answerType;
+    bool ran;
+  };
+  for (const Case& c : {Case{3, false}, Case{5, true}}) {
+    service().Reset();
+    int32_t exitCode = -1;
+    std::vector<std::string> errorLines;
+    auto run = std::async(std::launch::async, [&] {
+      return RunProcess({"./curl"}, "user = \"u:p\"", exitCode, errorLines);
+    });
+    const uint32_t id = HeaderOf(service().WaitForMessage(1)).id;
+    service().SetAccept(false);
+    ASSERT_EQ(Deliver(Message(id, c.answerType, 4)), 1);
+    ASSERT_EQ(run.wait_for(kWait), std::future_status::ready) << c.answerType;
+    EXPECT_EQ(run.get(), c.ran) << c.answerType;
+    EXPECT_EQ(exitCode, c.ran ? 4 : -1);
+    EXPECT_EQ(Deliver(Message(id, 5, 0)), 0) << "the id is forgotten";
+  }
+}
+
 TEST_F(ProcessServiceTest, WaitForExitEndsInputOfPs1Programs) {
   std::shared_ptr<client> process = Start(Opts({"run.ps1"}));
   auto waited = std::async(std::launch::async, [process] { WaitForExit(*process); });
