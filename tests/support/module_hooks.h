@@ -121,6 +121,11 @@ struct ManagerStateRecord {
 // Call on the host's dispatcher thread.
 using GetManagerStateFn = bool (*)(ManagerStateRecord& state);
 
+// "SetCodecLibraryDirectory": the directory the codec libraries are loaded
+// from (empty: the system's search path); `reloadNow` loads them afresh at
+// once. Call it while no clip is being written.
+using SetCodecLibraryDirectoryFn = void (*)(const char* directory, bool reloadNow);
+
 }  // namespace testhooks
 
 #endif  // ALERTMOD_TESTS_SUPPORT_MODULE_HOOKS_H_
