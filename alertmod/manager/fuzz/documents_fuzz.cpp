@@ -10,12 +10,10 @@
 //       catalogue knows, a key frame when b & 0x80, 40 ms apart;
 //   'T' tick: the clocks move on by the next byte's count of seconds.
 #include <tinyxml.h>
-#include <unistd.h>
 
 #include <cstddef>
 #include <cstdint>
 #include <cstdlib>
-#include <filesystem>
 #include <iterator>
 #include <map>
 #include <string>
@@ -24,6 +22,7 @@
 #include "alertmod/host_records.h"
 #include "alertmod/manager/notify_manager.h"
 #include "alertmod/platform/clock.h"
+#include "tests/support/fuzz_scratch.h"
 
 namespace {
 
@@ -123,44 +122,11 @@ class Session {
   size_t m_kept = 0;
 };
 
-// Configuration changes save "notify.xml" in the working directory, so the
-// fuzzer works in a directory of its own (in memory when possible). The
-// corpus paths and the crash files still refer to the caller's directory.
-void MoveToScratchDirectory(int* argc, char*** argv) {
-  static std::vector<std::string> args;
-  static std::vector<char*> pointers;
-  std::string origin(4096, '\0');
-  if (getcwd(origin.data(), origin.size()) == nullptr) return;
-  origin.resize(origin.find('\0'));
-  bool artifactPrefix = false;
-  for (int i = 0; i < *argc; ++i) {
-    std::string arg = (*argv)[i];
-    artifactPrefix = artifactPrefix || arg.rfind("-artifact_prefix=", 0) == 0;
-    if (i > 0 && !arg.empty() && arg[0] != '-' && arg[0] != '/') arg = origin + "/" + arg;
-    args.push_back(arg);
-  }
-  if (!artifactPrefix) args.push_back("-artifact_prefix=" + origin + "/");
-  for (std::string& arg : args) pointers.push_back(arg.data());
-  pointers.push_back(nullptr);
-  static std::string scratch;
-  for (const char* base : {"/dev/shm", "/tmp"}) {
-    scratch = std::string(base) + "/documents_fuzz.XXXXXX";
-    if (mkdtemp(scratch.data()) != nullptr && chdir(scratch.c_str()) == 0) {
-      std::atexit([] {
-        std::error_code ignored;
-        std::filesystem::remove_all(scratch, ignored);
-      });
-      break;
-    }
-  }
-  *argc = static_cast<int>(args.size());
-  *argv = pointers.data();
-}
-
 }  // namespace
 
 extern "C" int LLVMFuzzerInitialize(int* argc, char*** argv) {
-  MoveToScratchDirectory(argc, argv);
+  // Configuration changes save "notify.xml" in the working directory.
+  testsupport::MoveToFuzzScratchDirectory(argc, argv, "documents_fuzz");
   hx::platform::SetTickSource([](void*) { return g_tickMs; }, nullptr);
   hx::platform::SetWallSource([](void*) { return g_wallSeconds; }, nullptr);
   return 0;
