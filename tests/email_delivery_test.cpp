@@ -27,9 +27,16 @@ constexpr int32_t kProfile = 3;
 constexpr uint32_t kAlarmSender = 0x10000;
 
 struct ServerSpec {
+  ServerSpec(std::string description, int port, int useSsl = 0, std::string user = "",
+             std::string password = "")
+      : description(std::move(description)),
+        port(port),
+        useSsl(useSsl),
+        user(std::move(user)),
+        password(std::move(password)) {}
   std::string description;
-  int port = 0;
-  int useSsl = 0;
+  int port;
+  int useSsl;
   std::string user;
   std::string password;
 };

@@ -1,5 +1,4 @@
 #include "alertmod/mail/templates.h"
-#include "alertmod/config/xml_document.h"
 
 #include <tinyxml.h>
 
@@ -8,6 +7,7 @@
 #include <optional>
 #include <vector>
 
+#include "alertmod/config/xml_document.h"
 #include "alertmod/diag/log.h"
 #include "alertmod/mail/event_types.h"
 #include "alertmod/platform/local_time.h"
@@ -44,10 +44,6 @@ constexpr char kAllowedConversions[] = "aAbBcdHIjmMpSUwWxXyYZ%";
 constexpr size_t kFormattedDateCapacity = 80;
 
 // Event types whose source is a camera, so that a link to video makes sense.
-bool IsVideoEventType(int32_t code) {
-  return code == 1 || code == 2 || code == 9 || code == 18;
-}
-
 bool ContainsAny(const std::string& text, const char* const* first, const char* const* last) {
   for (; first != last; ++first) {
     if (text.find(*first) != std::string::npos) return true;
@@ -74,7 +70,7 @@ void ExpandWebLink(NotifyWorkItem& item, core::HostCallbackFn callback) {
     LogToHost(core::kModuleId, callback, LogLevelWarning,
               "Web Server not configured. No link will be generated");
     link = kNoWebServerText;
-  } else if (IsVideoEventType(item.eventType) || item.sourceKey == kTestSourceKey ||
+  } else if (IsCameraEventType(item.eventType) || item.sourceKey == kTestSourceKey ||
              !item.videoSources.empty()) {
     std::vector<uint32_t> cameraKeys;
     for (const VideoSource& source : item.videoSources) cameraKeys.push_back(source.sourceKey);

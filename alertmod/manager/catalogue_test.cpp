@@ -445,9 +445,9 @@ TEST(SystemDocumentTest, WritesEventsAndAlarmsWhereTheModuleReadsThem) {
 
   refhost::AlarmDocument alarm;
   alarm.serverSerial = "S-1";
-  alarm.requests.push_back(refhost::AlarmRequest());
+  alarm.requests.resize(1);
   alarm.requests[0].time = 1700000000;
-  alarm.requests[0].message = "Testing Profile";
+  alarm.requests[0].message = std::string("Testing Profile");
   TiXmlDocument alarmDocument;
   alarmDocument.Parse(refhost::BuildAlarmDocument(alarm).c_str());
   TiXmlHandle alarmRoot(alarmDocument.RootElement());

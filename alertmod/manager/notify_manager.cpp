@@ -7,6 +7,7 @@
 
 #include "alertmod/diag/log.h"
 #include "alertmod/platform/clock.h"
+#include "alertmod/video/av_libs.h"
 
 namespace hx {
 namespace {
@@ -29,6 +30,10 @@ NotifyManager::NotifyManager(core::HostCallbackFn callback, WorkerJobFactory job
       m_configServices(MakeConfigServices(callback)),
       m_videoBuffer(callback) {
   GetLgr()->SetFileName("notifylog.txt");
+  // The codec libraries are loaded while the host loads the module, so that
+  // the first clip does not wait for them. Without them the module works on
+  // and sends messages without clips.
+  av_init::Instance();
 }
 
 NotifyManager::~NotifyManager() {
