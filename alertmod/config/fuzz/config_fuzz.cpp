@@ -22,13 +22,17 @@ void Check(bool condition) {
   if (!condition) __builtin_trap();
 }
 
-// TinyXML condenses runs of white space in text as it reads it, and a text
-// read from malformed entities may hold a run it made itself; the next read
-// condenses that too. Such runs count as one space.
+// TinyXML condenses white space in text as it reads it (runs become one
+// space, a text's leading and trailing spaces go), and a text read from
+// malformed entities may hold spaces it made itself, which the next read
+// condenses. Texts are compared in their condensed form.
 std::string Condensed(const std::string& text) {
   std::string condensed;
   for (char c : text) {
-    if (c != ' ' || condensed.empty() || condensed.back() != ' ') condensed.push_back(c);
+    const char last = condensed.empty() ? '>' : condensed.back();
+    if (c == ' ' && (last == ' ' || last == '>')) continue;
+    if (c == '<' && last == ' ') condensed.pop_back();
+    condensed.push_back(c);
   }
   return condensed;
 }
