@@ -148,7 +148,9 @@ class ClipEmailTest : public testsupport::ModuleHostTest {
                             "libavfilter.so.8", "libswresample.so.4"}) {
       std::string target = std::string(FFMPEG_LIBDIR) + "/" + lib;
       if (std::string(lib) == "libswresample.so.4") target = swresample;
-      if (!target.empty()) EXPECT_EQ(symlink(target.c_str(), (path + "/" + lib).c_str()), 0);
+      if (!target.empty()) {
+        EXPECT_EQ(symlink(target.c_str(), (path + "/" + lib).c_str()), 0);
+      }
     }
     return path;
   }

@@ -82,7 +82,9 @@ TEST_F(RawExportsTest, LoadFillsOnlyItsFieldsOfTheOutRecord) {
   }
   written.insert({0x34, 0x36, 0x37});
   for (size_t i = 0; i < sizeof(out); ++i) {
-    if (written.count(i) == 0) EXPECT_EQ(bytes[i], 0xAB) << "byte " << i;
+    if (written.count(i) == 0) {
+      EXPECT_EQ(bytes[i], 0xAB) << "byte " << i;
+    }
   }
 }
 

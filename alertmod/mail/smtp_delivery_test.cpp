@@ -83,7 +83,9 @@ TEST(TransferArgumentsTest, AccountGoesThroughStandardInputQuoted) {
     Args args;
     BuildTransferArguments(Mail(), server, args);
     for (const std::string& a : args) {
-      if (!c.password.empty()) EXPECT_EQ(a.find(c.password), std::string::npos);
+      if (!c.password.empty()) {
+        EXPECT_EQ(a.find(c.password), std::string::npos);
+      }
     }
   }
 }
