@@ -23,8 +23,7 @@ std::atomic<hx::NotifyManager*> g_manager{nullptr};
 bool SendProcessMessageToHost(const void* data, uint64_t length) {
   HostCallbackFn callback = g_hostCallback.load();
   if (callback == nullptr) return false;
-  hx::core::HostRequest request =
-      hx::core::MakeHostRequest(kModuleId, hx::core::kClassProcess, 0);
+  hx::core::HostRequest request = hx::core::MakeHostRequest(kModuleId, hx::core::kClassProcess, 0);
   request.length = static_cast<uint32_t>(length);
   request.data = const_cast<void*>(data);
   return callback(&request, nullptr) == 0;
@@ -39,8 +38,8 @@ int32_t Guarded(const char* entry, Body body) {
     hx::LogToHost(kModuleId, g_hostCallback.load(), hx::LogLevelError,
                   "Unexpected failure in %s: %s", entry, e.what());
   } catch (...) {
-    hx::LogToHost(kModuleId, g_hostCallback.load(), hx::LogLevelError,
-                  "Unexpected failure in %s", entry);
+    hx::LogToHost(kModuleId, g_hostCallback.load(), hx::LogLevelError, "Unexpected failure in %s",
+                  entry);
   }
   return 0;
 }

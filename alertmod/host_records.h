@@ -162,15 +162,15 @@ struct HostRequest {
   uint32_t version;  // 0x04: always 1
   uint32_t length;   // 0x08: data length in bytes
   uint32_t reserved0;
-  void* data;               // 0x10
-  uint32_t requester;       // 0x18: module id of the requester
-  uint32_t reserved1;       // 0x1C
-  uint32_t requestClass;    // 0x20
-  uint32_t code;            // 0x24
-  uint32_t extSize;         // 0x28: class-specific; 152 for log and crypto
-  uint32_t extVersion;      // 0x2C: 1 for log and crypto
-  int32_t extValue;         // 0x30: log level, or crypto in/out length
-  uint8_t extRest[0x8C];    // 0x34 to 0xBF
+  void* data;             // 0x10
+  uint32_t requester;     // 0x18: module id of the requester
+  uint32_t reserved1;     // 0x1C
+  uint32_t requestClass;  // 0x20
+  uint32_t code;          // 0x24
+  uint32_t extSize;       // 0x28: class-specific; 152 for log and crypto
+  uint32_t extVersion;    // 0x2C: 1 for log and crypto
+  int32_t extValue;       // 0x30: log level, or crypto in/out length
+  uint8_t extRest[0x8C];  // 0x34 to 0xBF
 };
 
 // Returns a zero-filled request with size, version, requester, class and code set.

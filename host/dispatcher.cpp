@@ -4,7 +4,9 @@ namespace refhost {
 
 Dispatcher::Dispatcher() : m_thread([this] { Run(); }) {}
 
-Dispatcher::~Dispatcher() { Stop(); }
+Dispatcher::~Dispatcher() {
+  Stop();
+}
 
 bool Dispatcher::Post(std::function<void()> task) {
   {

@@ -7,10 +7,10 @@
 #include <condition_variable>
 #include <deque>
 #include <functional>
-#include <memory>
-#include <stdexcept>
 #include <future>
+#include <memory>
 #include <mutex>
+#include <stdexcept>
 #include <thread>
 
 namespace refhost {

@@ -32,8 +32,12 @@ std::unique_ptr<ModuleLibrary> ModuleLibrary::Open(const std::string& path, std:
   return module;
 }
 
-ModuleLibrary::~ModuleLibrary() { dlclose(m_handle); }
+ModuleLibrary::~ModuleLibrary() {
+  dlclose(m_handle);
+}
 
-void* ModuleLibrary::Symbol(const char* name) const { return dlsym(m_handle, name); }
+void* ModuleLibrary::Symbol(const char* name) const {
+  return dlsym(m_handle, name);
+}
 
 }  // namespace refhost

@@ -24,7 +24,9 @@ ReferenceHost::ReferenceHost(HostOptions options)
   InstallDefaultHandlers();
 }
 
-ReferenceHost::~ReferenceHost() { Stop(); }
+ReferenceHost::~ReferenceHost() {
+  Stop();
+}
 
 void ReferenceHost::InstallDefaultHandlers() {
   // Documents and status reports are only recorded; services that need more

@@ -34,9 +34,9 @@ namespace refhost {
 struct HostOptions {
   std::string modulePath;
   int32_t logThreshold = 25;
-  std::string logFile;          // empty: standard error
-  bool echoLog = true;          // write log lines as they come
-  bool recordRequests = true;   // keep every request in Requests()
+  std::string logFile;                      // empty: standard error
+  bool echoLog = true;                      // write log lines as they come
+  bool recordRequests = true;               // keep every request in Requests()
   std::string transferTool = "curl";        // what "./curl" runs: a path or a name on PATH
   std::string hostKeyFile = "hostkey.bin";  // password key, relative to the working directory
 };

@@ -372,10 +372,9 @@ TEST(HostProgramTest, ShowsThePostedConfigurationWithMaskedPasswords) {
   ASSERT_TRUE(WriteFile(
       "notify.xml", "<Trellan>" + Notify(Server("main", kPassword), Profile(1)) + "</Trellan>"));
   int status = -1;
-  std::string output =
-      RunCommand(std::string(ALERTMOD_HOST_PROGRAM) + " show-config --module " +
-                     testsupport::ProductionModulePath() + " 2>&1",
-                 &status);
+  std::string output = RunCommand(std::string(ALERTMOD_HOST_PROGRAM) + " show-config --module " +
+                                      testsupport::ProductionModulePath() + " 2>&1",
+                                  &status);
   EXPECT_EQ(status, 0) << output;
   EXPECT_NE(output.find("Configuration posted by the module:"), std::string::npos) << output;
   EXPECT_NE(output.find("<Authentication username=\"u\" password=\"***\" />"), std::string::npos)

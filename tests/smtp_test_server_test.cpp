@@ -13,9 +13,10 @@ namespace {
 using testsupport::SmtpTestServer;
 
 int Curl(const std::string& url, const std::string& file, const std::string& extra) {
-  std::string command = "curl -sS --mail-from sender@example.com --mail-rcpt a@example.com "
-                        "--mail-rcpt b@example.com --insecure --connect-timeout 10 " +
-                        extra + " -T '" + file + "' '" + url + "' 2>/dev/null";
+  std::string command =
+      "curl -sS --mail-from sender@example.com --mail-rcpt a@example.com "
+      "--mail-rcpt b@example.com --insecure --connect-timeout 10 " +
+      extra + " -T '" + file + "' '" + url + "' 2>/dev/null";
   int status = system(command.c_str());
   return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
 }

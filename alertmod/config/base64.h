@@ -11,7 +11,9 @@
 namespace hx {
 
 // Characters needed to encode `length` bytes, padding included.
-constexpr size_t Base64EncodedLength(size_t length) { return (length + 2) / 3 * 4; }
+constexpr size_t Base64EncodedLength(size_t length) {
+  return (length + 2) / 3 * 4;
+}
 
 // Encodes `length` bytes of `data` into `out`, which must have room for
 // Base64EncodedLength(length) characters. Returns the number written.

@@ -11,8 +11,13 @@ TEST(Base64Test, EncodesWithPadding) {
     std::string text;
   };
   const Case cases[] = {
-      {"", ""},        {"f", "Zg=="},       {"fo", "Zm8="},          {"foo", "Zm9v"},
-      {"foob", "Zm9vYg=="}, {"fooba", "Zm9vYmE="}, {"foobar", "Zm9vYmFy"},
+      {"", ""},
+      {"f", "Zg=="},
+      {"fo", "Zm8="},
+      {"foo", "Zm9v"},
+      {"foob", "Zm9vYg=="},
+      {"fooba", "Zm9vYmE="},
+      {"foobar", "Zm9vYmFy"},
       {std::string("\xff\xfe\x00", 3), "//4A"},
   };
   for (const Case& c : cases) {

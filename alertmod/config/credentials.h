@@ -34,9 +34,8 @@ std::optional<std::string> ProtectPassword(const std::string& password, uint32_t
 // decryption form ("Resizing decryption buffer: N", "decyrption error: N",
 // "Decryption Failure, reached max attempts"), and "decryption failure" for
 // a result without the marker (another host's key, damaged text).
-std::optional<std::string> UnprotectPassword(const std::string& protectedBytes,
-                                             uint32_t requester, core::HostCallbackFn callback,
-                                             const ErrorSink& sink);
+std::optional<std::string> UnprotectPassword(const std::string& protectedBytes, uint32_t requester,
+                                             core::HostCallbackFn callback, const ErrorSink& sink);
 
 }  // namespace hx
 

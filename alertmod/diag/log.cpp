@@ -5,8 +5,8 @@
 
 namespace hx {
 
-int32_t LogToHost(uint32_t source, core::HostCallbackFn callback, int32_t level,
-                  const char* format, ...) {
+int32_t LogToHost(uint32_t source, core::HostCallbackFn callback, int32_t level, const char* format,
+                  ...) {
   if (callback == nullptr || format == nullptr) return 0;
 
   // The threshold is asked for every message so that the host may change its
@@ -35,7 +35,9 @@ int32_t LogToHost(uint32_t source, core::HostCallbackFn callback, int32_t level,
 
 LogImpl::LogImpl() : m_fileName("debugsrvlog.txt") {}
 
-LogImpl::~LogImpl() { CloseStream(); }
+LogImpl::~LogImpl() {
+  CloseStream();
+}
 
 std::ofstream& LogImpl::Stream() {
   if (!m_stream.is_open()) OpenStream();

@@ -30,8 +30,8 @@ constexpr int kMaxLogTextLength = 2047;
 // Formats `format` printf-style and sends it at `level` under `source`.
 // Returns the callback's result for the write, or 0 when nothing was sent: no
 // callback, level below the host's threshold, or an empty or failed format.
-int32_t LogToHost(uint32_t source, core::HostCallbackFn callback, int32_t level,
-                  const char* format, ...) __attribute__((format(printf, 4, 5)));
+int32_t LogToHost(uint32_t source, core::HostCallbackFn callback, int32_t level, const char* format,
+                  ...) __attribute__((format(printf, 4, 5)));
 
 class ILgr {
  public:

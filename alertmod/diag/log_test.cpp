@@ -108,7 +108,9 @@ TEST(FileLoggerTest, ReopensAfterAFailedOpen) {
   EXPECT_EQ(testsupport::ReadFile("log.txt"), "ok\n");
 }
 
-TEST(FileLoggerTest, IsOneProcessWideObject) { EXPECT_EQ(GetLgr().get(), GetLgr().get()); }
+TEST(FileLoggerTest, IsOneProcessWideObject) {
+  EXPECT_EQ(GetLgr().get(), GetLgr().get());
+}
 
 }  // namespace
 }  // namespace hx

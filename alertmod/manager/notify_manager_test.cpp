@@ -51,7 +51,9 @@ class RecordingJob final : public IWorkerJob {
 
   explicit RecordingJob(Shared* shared) : m_shared(shared) {}
 
-  void Start(const WorkerSettings&) override { Update([&] { m_shared->started = true; }); }
+  void Start(const WorkerSettings&) override {
+    Update([&] { m_shared->started = true; });
+  }
   bool HasPendingRetries() const override {
     std::lock_guard<std::mutex> lock(m_shared->mutex);
     return m_shared->pendingRetries;
@@ -67,8 +69,12 @@ class RecordingJob final : public IWorkerJob {
     m_shared->signal.wait(lock, [this] { return !m_shared->holdRuns; });
     if (m_shared->throwOnRun) throw std::runtime_error("boom");
   }
-  void RetryPass() override { Update([&] { ++m_shared->retryPasses; }); }
-  void Stop() override { Update([&] { m_shared->stopped = true; }); }
+  void RetryPass() override {
+    Update([&] { ++m_shared->retryPasses; });
+  }
+  void Stop() override {
+    Update([&] { m_shared->stopped = true; });
+  }
 
  private:
   template <typename Fn>
@@ -93,8 +99,8 @@ class NotifyManagerTest : public ::testing::Test {
  protected:
   NotifyManagerTest()
       : m_manager(m_host.callback(), [this] { return std::make_unique<RecordingJob>(&m_job); }) {
-    platform::SetWallSource([](void* c) { return static_cast<NotifyManagerTest*>(c)->m_now.load(); },
-                            this);
+    platform::SetWallSource(
+        [](void* c) { return static_cast<NotifyManagerTest*>(c)->m_now.load(); }, this);
   }
   ~NotifyManagerTest() override {
     if (m_worker.joinable()) {

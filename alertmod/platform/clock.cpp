@@ -23,7 +23,8 @@ std::atomic<const Source<WallSource>*> g_wallSource{nullptr};
 uint32_t SystemTickMs() {
   timespec now{};
   clock_gettime(CLOCK_MONOTONIC, &now);
-  uint64_t ms = static_cast<uint64_t>(now.tv_sec) * 1000u + static_cast<uint64_t>(now.tv_nsec) / 1000000u;
+  uint64_t ms =
+      static_cast<uint64_t>(now.tv_sec) * 1000u + static_cast<uint64_t>(now.tv_nsec) / 1000000u;
   return static_cast<uint32_t>(ms);
 }
 
@@ -56,9 +57,13 @@ int64_t WallSeconds() {
   return source ? source->fn(source->context) : static_cast<int64_t>(time(nullptr));
 }
 
-void SetTickSource(TickSource source, void* context) { Install(g_tickSource, source, context); }
+void SetTickSource(TickSource source, void* context) {
+  Install(g_tickSource, source, context);
+}
 
-void SetWallSource(WallSource source, void* context) { Install(g_wallSource, source, context); }
+void SetWallSource(WallSource source, void* context) {
+  Install(g_wallSource, source, context);
+}
 
 }  // namespace platform
 }  // namespace hx

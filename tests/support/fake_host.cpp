@@ -13,7 +13,9 @@ FakeHost::FakeHost(int32_t logThreshold) : m_log(logThreshold, "", false) {
   g_current.store(this);
 }
 
-FakeHost::~FakeHost() { g_current.store(nullptr); }
+FakeHost::~FakeHost() {
+  g_current.store(nullptr);
+}
 
 void FakeHost::SetHandler(uint32_t requestClass, Handler handler) {
   std::lock_guard<std::mutex> lock(m_mutex);

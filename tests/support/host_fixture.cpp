@@ -6,8 +6,12 @@
 
 namespace testsupport {
 
-std::string TestingModulePath() { return ALERTMOD_TESTING_MODULE_PATH; }
-std::string ProductionModulePath() { return ALERTMOD_MODULE_PATH; }
+std::string TestingModulePath() {
+  return ALERTMOD_TESTING_MODULE_PATH;
+}
+std::string ProductionModulePath() {
+  return ALERTMOD_MODULE_PATH;
+}
 
 FakeClock& FakeClock::Instance() {
   static FakeClock* clock = new FakeClock();

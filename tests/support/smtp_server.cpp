@@ -86,13 +86,16 @@ SmtpTestServer::SmtpTestServer(Options options) : m_options(std::move(options)) 
   Start();
 }
 
-SmtpTestServer::~SmtpTestServer() { Stop(); }
+SmtpTestServer::~SmtpTestServer() {
+  Stop();
+}
 
 void SmtpTestServer::Start() {
   if (m_pid > 0) return;
   ASSERT_EQ(access(kPython, X_OK), 0) << kPython << " is needed for the SMTP test server";
-  std::vector<std::string> args = {kPython, ALERTMOD_TEST_SUPPORT_DIR "/smtp_server.py",
-                                   "--dir", m_dir.path(), "--port", std::to_string(m_port)};
+  std::vector<std::string> args = {kPython,  ALERTMOD_TEST_SUPPORT_DIR "/smtp_server.py",
+                                   "--dir",  m_dir.path(),
+                                   "--port", std::to_string(m_port)};
   const char* modes[] = {"plain", "starttls", "smtps"};
   args.insert(args.end(), {"--mode", modes[static_cast<int>(m_options.mode)]});
   if (!m_cert.empty()) args.insert(args.end(), {"--cert", m_cert, "--key", m_key});
@@ -153,8 +156,10 @@ int SmtpTestServer::FreePort() {
 bool MakeSelfSignedCertificate(const std::string& dir, std::string* cert, std::string* key) {
   *cert = dir + "/cert.pem";
   *key = dir + "/key.pem";
-  std::string command = "openssl req -x509 -newkey rsa:2048 -nodes -days 2 -subj /CN=127.0.0.1"
-                        " -keyout '" + *key + "' -out '" + *cert + "' >/dev/null 2>&1";
+  std::string command =
+      "openssl req -x509 -newkey rsa:2048 -nodes -days 2 -subj /CN=127.0.0.1"
+      " -keyout '" +
+      *key + "' -out '" + *cert + "' >/dev/null 2>&1";
   return system(command.c_str()) == 0;
 }
 

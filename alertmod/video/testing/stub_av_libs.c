@@ -13,15 +13,31 @@
 
 static int g_registerCalls[2];
 
-void av_register_all(void) { ++g_registerCalls[0]; }
-void avfilter_register_all(void) { ++g_registerCalls[1]; }
-int stub_register_calls(int which) { return g_registerCalls[which]; }
+void av_register_all(void) {
+  ++g_registerCalls[0];
+}
+void avfilter_register_all(void) {
+  ++g_registerCalls[1];
+}
+int stub_register_calls(int which) {
+  return g_registerCalls[which];
+}
 
-unsigned avcodec_version(void) { return LIBAVCODEC_VERSION_INT; }
-unsigned avformat_version(void) { return LIBAVFORMAT_VERSION_INT; }
-unsigned avutil_version(void) { return LIBAVUTIL_VERSION_INT; }
-unsigned avfilter_version(void) { return LIBAVFILTER_VERSION_INT; }
-unsigned swresample_version(void) { return LIBSWRESAMPLE_VERSION_INT; }
+unsigned avcodec_version(void) {
+  return LIBAVCODEC_VERSION_INT;
+}
+unsigned avformat_version(void) {
+  return LIBAVFORMAT_VERSION_INT;
+}
+unsigned avutil_version(void) {
+  return LIBAVUTIL_VERSION_INT;
+}
+unsigned avfilter_version(void) {
+  return LIBAVFILTER_VERSION_INT;
+}
+unsigned swresample_version(void) {
+  return LIBSWRESAMPLE_VERSION_INT;
+}
 
 STUB(avcodec_find_decoder)
 STUB(avcodec_find_encoder)

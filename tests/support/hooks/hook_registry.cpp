@@ -13,7 +13,9 @@ std::map<std::string, void*>& Registry() {
 
 }  // namespace
 
-HookRegistrar::HookRegistrar(const char* name, void* hook) { Registry()[name] = hook; }
+HookRegistrar::HookRegistrar(const char* name, void* hook) {
+  Registry()[name] = hook;
+}
 
 }  // namespace testhooks
 
