@@ -11,14 +11,6 @@ namespace {
 
 std::atomic<SideFileSyncedHook> g_sideFileSyncedHook{nullptr};
 
-std::string PrintIndented(const TiXmlDocument& document) {
-  TiXmlPrinter printer;
-  printer.SetIndent("    ");
-  printer.SetLineBreak("\n");
-  document.Accept(&printer);
-  return printer.Str();
-}
-
 // Writes `text` into a freshly created side file and forces it to the
 // device. Returns the error text, empty on success. Only the first failure is
 // reported: a close error after a write error says nothing new.
@@ -82,6 +74,14 @@ bool LoadCompleteSideFile(TiXmlDocument& document, const std::string& sideName) 
 
 }  // namespace
 
+std::string PrintXmlIndented(const TiXmlDocument& document) {
+  TiXmlPrinter printer;
+  printer.SetIndent("    ");
+  printer.SetLineBreak("\n");
+  document.Accept(&printer);
+  return printer.Str();
+}
+
 FileNameGuard& FileNameGuard::Instance() {
   static FileNameGuard guard;
   return guard;
@@ -107,7 +107,7 @@ void SetSideFileSyncedHook(SideFileSyncedHook hook) {
 
 bool SaveXmlDurably(const TiXmlDocument& document, const std::string& fileName,
                     std::string* errorText) {
-  const std::string text = PrintIndented(document);
+  const std::string text = PrintXmlIndented(document);
   const std::string sideName = fileName + kPendingSuffix;
   FileNameLock held(fileName);
 

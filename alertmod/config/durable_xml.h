@@ -20,6 +20,10 @@ namespace hx {
 // Suffix of the side file that a save writes before renaming it.
 constexpr const char kPendingSuffix[] = ".pending";
 
+// The printed form of a saved file: four spaces of indentation per level
+// and a line feed after every line.
+std::string PrintXmlIndented(const TiXmlDocument& document);
+
 // Prints `document` with four-space indentation and LF line ends and stores
 // it as `fileName`. False on failure, with the reason in `errorText` when
 // given; the target file is never damaged. The texts are "create error N",

@@ -11,6 +11,7 @@
 #include <cstdio>
 #include <string>
 
+#include "alertmod/config/durable_xml.h"
 #include "alertmod/config/module_replies.h"
 #include "alertmod/config/notify_cfg.h"
 #include "alertmod/config/xml_document.h"
@@ -67,14 +68,6 @@ hx::ConfigServices Services() {
   return services;
 }
 
-std::string PrintIndented(const TiXmlDocument& document) {
-  TiXmlPrinter printer;
-  printer.SetIndent("    ");
-  printer.SetLineBreak("\n");
-  document.Accept(&printer);
-  return printer.Str();
-}
-
 // The compact configuration document of `config`.
 std::string Built(const hx::NotifyCfg& config, const hx::ConfigServices& services) {
   TiXmlDocument document;
@@ -108,7 +101,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
 
   TiXmlDocument saved;
   hx::BuildConfigDocument(saved, config, services);
-  CheckSame(built, Built(ReadBack(PrintIndented(saved), services), services));
+  CheckSame(built, Built(ReadBack(hx::PrintXmlIndented(saved), services), services));
 
   TiXmlDocument posted;
   hx::BuildConfigDocument(posted, config, services);

@@ -27,6 +27,7 @@
 
 #include "alertmod/host_records.h"
 #include "alertmod/hostsvc/process_service.h"
+#include "tests/support/fuzz_input.h"
 
 namespace {
 
@@ -131,28 +132,7 @@ bool SameText(const std::string& received, const std::string& lines) {
   return received == lines || received == lines + "\n";
 }
 
-class Reader {
- public:
-  Reader(const uint8_t* data, size_t size) : m_data(data), m_size(size) {}
-  bool Empty() const { return m_at >= m_size; }
-  uint8_t Byte() { return m_at < m_size ? m_data[m_at++] : 0; }
-  uint32_t Word() {
-    uint32_t value = 0;
-    for (int i = 0; i < 4; ++i) value |= uint32_t{Byte()} << (8 * i);
-    return value;
-  }
-  std::string Bytes(size_t count) {
-    count = std::min(count, m_size - std::min(m_at, m_size));
-    std::string bytes(reinterpret_cast<const char*>(m_data + m_at), count);
-    m_at += count;
-    return bytes;
-  }
-
- private:
-  const uint8_t* m_data;
-  size_t m_size;
-  size_t m_at = 0;
-};
+using Reader = testsupport::FuzzInput;
 
 // Plays the host's side of one record, noting what the module accepted.
 void PlayRecord(Reader& reader, uint32_t liveId, Accepted& accepted) {

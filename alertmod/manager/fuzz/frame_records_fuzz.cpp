@@ -30,6 +30,7 @@
 #include "alertmod/platform/clock.h"
 #include "host/system_description.h"
 #include "tests/support/fake_host.h"
+#include "tests/support/fuzz_input.h"
 #include "tests/support/fuzz_scratch.h"
 
 namespace {
@@ -94,22 +95,7 @@ std::string SizeLimitDocument(int megabytes) {
          "</Profiles></Notify></Trellan>";
 }
 
-class Reader {
- public:
-  Reader(const uint8_t* data, size_t size) : m_data(data), m_size(size) {}
-  bool Empty() const { return m_at >= m_size; }
-  uint8_t Byte() { return m_at < m_size ? m_data[m_at++] : 0; }
-  uint32_t Word() {
-    uint32_t value = 0;
-    for (int i = 0; i < 4; ++i) value |= uint32_t{Byte()} << (8 * i);
-    return value;
-  }
-
- private:
-  const uint8_t* m_data;
-  size_t m_size;
-  size_t m_at = 0;
-};
+using Reader = testsupport::FuzzInput;
 
 class Session {
  public:
