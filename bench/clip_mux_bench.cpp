@@ -15,7 +15,7 @@
 
 namespace {
 
-const cliptest::MediaSpec kSpec{hx::kCodecH264, 1920, 1080, 250, 25};
+const cliptest::MediaRecipe kRecipe{hx::kCodecH264, 1920, 1080, 250, 25};
 
 struct BenchMedia {
   std::string directory;
@@ -26,9 +26,9 @@ struct BenchMedia {
   BenchMedia() {
     char pattern[] = "/tmp/clip-mux-bench-XXXXXX";
     directory = mkdtemp(pattern) ? pattern : "/tmp";
-    frames = cliptest::MakeFrames(kSpec, directory);
+    frames = cliptest::MakeFrames(kRecipe, directory);
     stream = directory + "/source.es";
-    clip = std::make_unique<cliptest::HostClip>(kSpec, frames, "HOSTHEADER", 1000, 40);
+    clip = std::make_unique<cliptest::HostClip>(kRecipe, frames, "HOSTHEADER", 1000, 40);
   }
   ~BenchMedia() { cliptest::RunCommand("rm -rf '" + directory + "'", nullptr); }
 };
@@ -40,7 +40,7 @@ BenchMedia& Media() {
 
 void BM_InProcessMux(benchmark::State& state) {
   BenchMedia& media = Media();
-  if (media.frames.size() != kSpec.frames) {
+  if (media.frames.size() != kRecipe.frames) {
     state.SkipWithError("test media could not be made with ffmpeg");
     return;
   }
@@ -55,7 +55,7 @@ BENCHMARK(BM_InProcessMux)->Unit(benchmark::kMillisecond);
 
 void BM_FfmpegCopyBaseline(benchmark::State& state) {
   BenchMedia& media = Media();
-  if (media.frames.size() != kSpec.frames) {
+  if (media.frames.size() != kRecipe.frames) {
     state.SkipWithError("test media could not be made with ffmpeg");
     return;
   }

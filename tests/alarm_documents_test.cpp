@@ -17,7 +17,7 @@ namespace {
 using managertest::kAlarmSender;
 using managertest::NotifyElement;
 using managertest::NotifyFile;
-using managertest::ProfileSpec;
+using managertest::ProfileSetting;
 using refhost::AlarmDocument;
 using refhost::AlarmRequest;
 using refhost::EventSourceRef;
@@ -70,10 +70,10 @@ class AlarmDocumentsTest : public managertest::ManagerHostTest {
 };
 
 TEST_F(AlarmDocumentsTest, ItemsCarryTheCataloguesNamesAndTheServersFacts) {
-  ProfileSpec templated{1, "Front door"};
+  ProfileSetting templated{1, "Front door"};
   templated.eventEdge = 2;
   templated.subject = "{system name}: {event state}";
-  ProfileSpec plain{2, "Plain"};
+  ProfileSetting plain{2, "Plain"};
   StartWith(NotifyFile({templated, plain}));
   SendSystem(Site());
   struct Case {
@@ -138,9 +138,9 @@ TEST_F(AlarmDocumentsTest, ItemsCarryTheCataloguesNamesAndTheServersFacts) {
 }
 
 TEST_F(AlarmDocumentsTest, EventEdgeDecidesWhichAlarmValueNotifies) {
-  std::vector<ProfileSpec> profiles;
+  std::vector<ProfileSetting> profiles;
   for (int32_t edge = 0; edge <= 2; ++edge) {
-    ProfileSpec profile{10 + edge, "Edge " + std::to_string(edge)};
+    ProfileSetting profile{10 + edge, "Edge " + std::to_string(edge)};
     profile.eventEdge = edge;
     profiles.push_back(profile);
   }
@@ -170,10 +170,10 @@ TEST_F(AlarmDocumentsTest, WaitingNotificationsAreReleasedByTheEdgeThatEndsThem)
       {0, 1, 0, true},  {0, 1, 1, false}, {1, 0, 1, true},
       {1, 0, 0, false}, {2, 1, 1, true},  {2, 1, 0, true},
   };
-  std::vector<ProfileSpec> profiles;
+  std::vector<ProfileSetting> profiles;
   refhost::SystemDescription site;
   for (int32_t i = 0; i < static_cast<int32_t>(std::size(cases)); ++i) {
-    ProfileSpec profile{20 + i, "Case " + std::to_string(i)};
+    ProfileSetting profile{20 + i, "Case " + std::to_string(i)};
     profile.attach = true;
     profile.maxVideoSeconds = 60;  // the clip goes on collecting
     profile.eventEdge = cases[i].edge;
@@ -212,7 +212,7 @@ TEST_F(AlarmDocumentsTest, WaitingNotificationsAreReleasedByTheEdgeThatEndsThem)
 }
 
 TEST_F(AlarmDocumentsTest, ThrottleCountsOnTheWrappingTick) {
-  ProfileSpec profile{1, "Throttled"};
+  ProfileSetting profile{1, "Throttled"};
   profile.throttleSeconds = 60;
   profile.eventEdge = 2;
   // The tick wraps 4 s after the first request.
@@ -223,7 +223,7 @@ TEST_F(AlarmDocumentsTest, ThrottleCountsOnTheWrappingTick) {
     Send({Request(1, 1, Source(kEncoders, 1, 0, 1), message)});
   };
   auto throttle = [&](int32_t seconds) {
-    ProfileSpec changed = profile;
+    ProfileSetting changed = profile;
     changed.throttleSeconds = seconds;
     host().SendConfigurationUpdate(NotifyElement({changed}));
   };
@@ -251,7 +251,7 @@ TEST_F(AlarmDocumentsTest, ThrottleCountsOnTheWrappingTick) {
 }
 
 TEST_F(AlarmDocumentsTest, TestRequestsIgnoreTheEdgeButNotTheThrottle) {
-  ProfileSpec profile{4, "End only"};
+  ProfileSetting profile{4, "End only"};
   profile.eventEdge = 1;
   profile.throttleSeconds = 60;
   StartWith(NotifyFile({profile}));
@@ -269,7 +269,7 @@ TEST_F(AlarmDocumentsTest, TestRequestsIgnoreTheEdgeButNotTheThrottle) {
 }
 
 TEST_F(AlarmDocumentsTest, RequestsThatCannotBeReadAreSkippedAndTheOthersRun) {
-  StartWith(NotifyFile({ProfileSpec{1, "Front door"}}));
+  StartWith(NotifyFile({ProfileSetting{1, "Front door"}}));
   SendSystem(Site());
   const std::string source =
       R"(<EventSource Plugin="65536" Device="1" Input="0" Context="0" Type="1"/>)";
@@ -316,7 +316,7 @@ struct Snapshot {
 };
 
 TEST_F(AlarmDocumentsTest, MalformedTruncatedAndHugeDocumentsChangeNothing) {
-  StartWith(NotifyFile({ProfileSpec{1, "Front door"}}));
+  StartWith(NotifyFile({ProfileSetting{1, "Front door"}}));
   SendSystem(Site());
   ASSERT_TRUE(PushFrame(kLobby, true));
   AlarmDocument serial;

@@ -26,9 +26,9 @@ using testsupport::SmtpTestServer;
 constexpr int32_t kProfile = 3;
 constexpr uint32_t kAlarmSender = 0x10000;
 
-struct ServerSpec {
-  ServerSpec(std::string description, int port, int useSsl = 0, std::string user = "",
-             std::string password = "")
+struct ServerSetting {
+  ServerSetting(std::string description, int port, int useSsl = 0, std::string user = "",
+                std::string password = "")
       : description(std::move(description)),
         port(port),
         useSsl(useSsl),
@@ -41,7 +41,7 @@ struct ServerSpec {
   std::string password;
 };
 
-struct ProfileSpec {
+struct ProfileSetting {
   std::string subject = "Alarm";
   std::string body = "Something happened.";
   std::string from = "Alarm Desk &lt;alarm@example.com&gt;";
@@ -49,14 +49,15 @@ struct ProfileSpec {
   std::vector<std::string> bcc;
 };
 
-std::string ConfigurationText(const std::vector<ServerSpec>& servers, const ProfileSpec& profile,
-                              int maxRetryQueue, int maxRetrySeconds) {
+std::string ConfigurationText(const std::vector<ServerSetting>& servers,
+                              const ProfileSetting& profile, int maxRetryQueue,
+                              int maxRetrySeconds) {
   std::string xml = "<?xml ?><Trellan Delta=\"0\"><Notify ID=\"786432\" MaxRetrySeconds=\"" +
                     std::to_string(maxRetrySeconds) + "\" MaxRetryQueue=\"" +
                     std::to_string(maxRetryQueue) +
                     "\" EmailSizeLimitMB=\"10\"><Web address=\"\" />"
                     "<Servers>";
-  for (const ServerSpec& s : servers) {
+  for (const ServerSetting& s : servers) {
     xml += "<smtp description=\"" + s.description + "\" address=\"127.0.0.1\" port=\"" +
            std::to_string(s.port) + "\" UseSSL=\"" + std::to_string(s.useSsl) + "\">";
     if (!s.user.empty()) {
@@ -78,7 +79,7 @@ std::atomic<uint64_t> g_freeBytes{uint64_t{1} << 40};
 
 class EmailDeliveryTest : public testsupport::ModuleHostTest {
  protected:
-  void Start(const std::vector<ServerSpec>& servers, const ProfileSpec& profile = {},
+  void Start(const std::vector<ServerSetting>& servers, const ProfileSetting& profile = {},
              int maxRetryQueue = 100, int maxRetrySeconds = 172800) {
     ASSERT_TRUE(testsupport::WriteFile(
         "notify.xml", ConfigurationText(servers, profile, maxRetryQueue, maxRetrySeconds)));
@@ -180,7 +181,7 @@ class EmailDeliveryTest : public testsupport::ModuleHostTest {
 
 TEST_F(EmailDeliveryTest, PlainSmtpDeliversTheComposedFileUnchanged) {
   SmtpTestServer smtp;
-  ProfileSpec profile;
+  ProfileSetting profile;
   profile.subject = "{event type} on {source}";
   profile.bcc = {"audit@example.com"};
   Start({{"local", smtp.port()}}, profile);
@@ -303,7 +304,7 @@ TEST_F(EmailDeliveryTest, QueueLimitDropsTheOldestMessage) {
 }
 
 TEST_F(EmailDeliveryTest, LowDiskSpacePurgesAndDiscards) {
-  ProfileSpec big;
+  ProfileSetting big;
   big.body = std::string(6000, 'x');  // large enough to be worth purging
   Start({{"down", SmtpTestServer::FreePort()}}, big);
   SendTestAlarm();

@@ -6,14 +6,14 @@
 
 namespace managertest {
 
-std::string NotifyFile(const std::vector<ProfileSpec>& profiles, int32_t emailSizeLimitMB) {
+std::string NotifyFile(const std::vector<ProfileSetting>& profiles, int32_t emailSizeLimitMB) {
   return "<Trellan>" + NotifyElement(profiles, emailSizeLimitMB) + "</Trellan>";
 }
 
-std::string NotifyElement(const std::vector<ProfileSpec>& profiles, int32_t emailSizeLimitMB) {
+std::string NotifyElement(const std::vector<ProfileSetting>& profiles, int32_t emailSizeLimitMB) {
   std::string text = "<Notify ID=\"786432\" EmailSizeLimitMB=\"" +
                      std::to_string(emailSizeLimitMB) + "\"><Servers/><Profiles>";
-  for (const ProfileSpec& p : profiles) {
+  for (const ProfileSetting& p : profiles) {
     text += "<smtp ID=\"" + std::to_string(p.id) + "\" attach=\"" + (p.attach ? "1" : "0") +
             "\" description=\"" + p.description + "\" ThrottleSeconds=\"" +
             std::to_string(p.throttleSeconds) + "\" from=\"cam@example\" subject=\"" + p.subject +

@@ -22,7 +22,7 @@ namespace managertest {
 constexpr uint32_t kAlarmSender = 0x10000;
 
 // A profile of "notify.xml".
-struct ProfileSpec {
+struct ProfileSetting {
   int32_t id = 1;
   std::string description = "Front door";
   bool attach = false;
@@ -35,8 +35,9 @@ struct ProfileSpec {
 
 // The "Notify" element of `profiles`, with no SMTP server and the given size
 // limit; NotifyFile wraps it as "notify.xml".
-std::string NotifyElement(const std::vector<ProfileSpec>& profiles, int32_t emailSizeLimitMB = 10);
-std::string NotifyFile(const std::vector<ProfileSpec>& profiles, int32_t emailSizeLimitMB = 10);
+std::string NotifyElement(const std::vector<ProfileSetting>& profiles,
+                          int32_t emailSizeLimitMB = 10);
+std::string NotifyFile(const std::vector<ProfileSetting>& profiles, int32_t emailSizeLimitMB = 10);
 
 class ManagerHostTest : public testsupport::ModuleHostTest {
  protected:

@@ -13,7 +13,7 @@
 
 namespace {
 
-using refhost::scenario::ConfigSpec;
+using refhost::scenario::ConfigSetting;
 using refhost::scenario::ParseOptions;
 using refhost::scenario::ParseResult;
 using refhost::scenario::ParseScenario;
@@ -131,8 +131,8 @@ TEST(ScenarioParserTest, ReadsAWholeScenario) {
   EXPECT_EQ(s.system.events[0].preAlarmSeconds, 3);
   EXPECT_EQ(s.system.events[0].notifyProfiles, (std::vector<int32_t>{1, 2}));
 
-  const ConfigSpec& config = s.config;
-  EXPECT_EQ(config.source, ConfigSpec::Source::kInline);
+  const ConfigSetting& config = s.config;
+  EXPECT_EQ(config.source, ConfigSetting::Source::kInline);
   ASSERT_EQ(config.servers.size(), 1u);
   EXPECT_EQ(config.servers[0].port, 25);
   EXPECT_EQ(config.servers[0].security, 2);
@@ -273,14 +273,14 @@ TEST(ScenarioParserTest, MissingFileIsOneFaultOfTheFile) {
 }
 
 TEST(ScenarioConfigTest, WritesOnlyWhatTheScenarioGives) {
-  ConfigSpec config;
-  config.source = ConfigSpec::Source::kInline;
+  ConfigSetting config;
+  config.source = ConfigSetting::Source::kInline;
   config.maxRetryQueue = 5;
-  refhost::scenario::SmtpServerSpec server;
+  refhost::scenario::SmtpServerSetting server;
   server.description = "S & T";
   server.address = "mail";
   config.servers.push_back(server);
-  refhost::scenario::ProfileSpec profile;
+  refhost::scenario::ProfileSetting profile;
   profile.id = 4;
   profile.description = "P";
   profile.from = "a@b";

@@ -14,7 +14,7 @@ namespace {
 
 using managertest::NotifyElement;
 using managertest::NotifyFile;
-using managertest::ProfileSpec;
+using managertest::ProfileSetting;
 using refhost::AlarmRequest;
 using refhost::EventSourceRef;
 using refhost::HostStreamId;
@@ -52,7 +52,7 @@ class SystemDocumentsTest : public managertest::ManagerHostTest {
 };
 
 TEST_F(SystemDocumentsTest, DeltaDecidesWhatADocumentChanges) {
-  StartWith(NotifyFile({ProfileSpec{1, "Front door"}}));
+  StartWith(NotifyFile({ProfileSetting{1, "Front door"}}));
   SendSystem(OneCamera(1, "Lobby"));
   EXPECT_EQ(State().videoSources, std::vector<uint32_t>{Id(1)});
   EXPECT_EQ(NameOfCamera(1), "Lobby");
@@ -60,7 +60,8 @@ TEST_F(SystemDocumentsTest, DeltaDecidesWhatADocumentChanges) {
   // A change document: the configuration only.
   const std::string camera2 = refhost::BuildSystemDocument(OneCamera(2, "Yard"));
   const std::string body = camera2.substr(camera2.find('>') + 1);
-  const std::string profiles = NotifyElement({ProfileSpec{1, "Front door"}, ProfileSpec{5, "New"}});
+  const std::string profiles =
+      NotifyElement({ProfileSetting{1, "Front door"}, ProfileSetting{5, "New"}});
   host().SendHostDocument("<Trellan Delta=\"1\">" + profiles + body);
   EXPECT_TRUE(WaitForLog("Updated configuration successfully"));
   EXPECT_NE(Posted().find("description=\"New\""), std::string::npos);
@@ -68,7 +69,7 @@ TEST_F(SystemDocumentsTest, DeltaDecidesWhatADocumentChanges) {
   EXPECT_EQ(NameOfCamera(2), "");
 
   // A full document: the catalogue and the video, not the configuration.
-  const std::string reduced = NotifyElement({ProfileSpec{1, "Front door"}});
+  const std::string reduced = NotifyElement({ProfileSetting{1, "Front door"}});
   host().SendHostDocument("<Trellan Delta=\"0\">" + reduced + body);
   EXPECT_EQ(State().videoSources, std::vector<uint32_t>{Id(2)});
   EXPECT_EQ(NameOfCamera(2), "Yard");
@@ -87,7 +88,7 @@ TEST_F(SystemDocumentsTest, DeltaDecidesWhatADocumentChanges) {
 }
 
 TEST_F(SystemDocumentsTest, CompressedCameraIsServedByItsSmallestStillStream) {
-  StartWith(NotifyFile({ProfileSpec{1, "Front door"}}));
+  StartWith(NotifyFile({ProfileSetting{1, "Front door"}}));
   refhost::SystemDescription system = OneCamera(1, "Lobby");
   system.cameras[0].streams = {
       StreamDescription{0, refhost::kStandardH264, 1280, 720, std::nullopt},
@@ -110,7 +111,7 @@ TEST_F(SystemDocumentsTest, CompressedCameraIsServedByItsSmallestStillStream) {
 }
 
 TEST_F(SystemDocumentsTest, AnalyticsAliasArrivingLaterBringsItsCamerasVideo) {
-  ProfileSpec profile{1, "Analytics"};
+  ProfileSetting profile{1, "Analytics"};
   profile.attach = true;
   profile.maxVideoSeconds = 0;
   StartWith(NotifyFile({profile}));
@@ -147,7 +148,7 @@ TEST_F(SystemDocumentsTest, AnalyticsAliasArrivingLaterBringsItsCamerasVideo) {
 }
 
 TEST_F(SystemDocumentsTest, BufferedStreamsFollowTheDescription) {
-  StartWith(NotifyFile({ProfileSpec{1, "Front door"}}));
+  StartWith(NotifyFile({ProfileSetting{1, "Front door"}}));
   refhost::SystemDescription both;
   both.cameras = {{"Lobby", kEncoders, 1, 0, {}}, {"Yard", kEncoders, 2, 0, {}}};
   both.events = {{1, std::nullopt, EventSourceRef::Camera(kEncoders, 1, 0), {1}},
@@ -189,7 +190,7 @@ TEST_F(SystemDocumentsTest, SizeLimitDecidesWhetherVideoIsBuffered) {
   };
   for (const Case& c : cases) {
     SCOPED_TRACE(c.emailSizeLimitMB);
-    StartWith(NotifyFile({ProfileSpec{1, "Front door"}}, c.emailSizeLimitMB));
+    StartWith(NotifyFile({ProfileSetting{1, "Front door"}}, c.emailSizeLimitMB));
     SendSystem(OneCamera(1, "Lobby"));
     EXPECT_EQ(PushFrame(Id(1), true), c.kept);
     const testhooks::ManagerStateRecord state = State();
@@ -200,10 +201,10 @@ TEST_F(SystemDocumentsTest, SizeLimitDecidesWhetherVideoIsBuffered) {
 }
 
 TEST_F(SystemDocumentsTest, AFrameLargerThanANewLimitIsRefused) {
-  StartWith(NotifyFile({ProfileSpec{1, "Front door"}}, 10));
+  StartWith(NotifyFile({ProfileSetting{1, "Front door"}}, 10));
   SendSystem(OneCamera(1, "Lobby"));
   EXPECT_TRUE(PushFrame(Id(1), true, 2 << 20));
-  host().SendConfigurationUpdate(NotifyElement({ProfileSpec{1, "Front door"}}, 1));
+  host().SendConfigurationUpdate(NotifyElement({ProfileSetting{1, "Front door"}}, 1));
   EXPECT_TRUE(WaitForLog("Updated configuration successfully"));
   EXPECT_FALSE(PushFrame(Id(1), true, 2 << 20));
   EXPECT_TRUE(PushFrame(Id(1), true, 1 << 19));

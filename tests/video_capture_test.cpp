@@ -17,7 +17,7 @@
 namespace {
 
 using managertest::NotifyFile;
-using managertest::ProfileSpec;
+using managertest::ProfileSetting;
 using refhost::AlarmRequest;
 using refhost::EventSourceRef;
 using refhost::HostStreamId;
@@ -35,8 +35,8 @@ refhost::CameraDescription Camera(const std::string& name, int32_t device, int32
   return {name, kEncoders, device, 0, {StreamDescription{0, standard, 320, 240, std::nullopt}}};
 }
 
-ProfileSpec AttachProfile(int32_t id, int32_t maxVideoSeconds) {
-  ProfileSpec profile{id, "Profile " + std::to_string(id)};
+ProfileSetting AttachProfile(int32_t id, int32_t maxVideoSeconds) {
+  ProfileSetting profile{id, "Profile " + std::to_string(id)};
   profile.attach = true;
   profile.maxVideoSeconds = maxVideoSeconds;
   profile.eventEdge = 2;
@@ -226,8 +226,8 @@ TEST_F(VideoCaptureTest, CameraWithoutBufferedVideoIsSentAtOnceWithoutIt) {
 }
 
 TEST_F(VideoCaptureTest, EachCaptureIsDescribedInOneLogLine) {
-  ProfileSpec plain{1, "Front door"};
-  ProfileSpec templated{2, "Back door"};
+  ProfileSetting plain{1, "Front door"};
+  ProfileSetting templated{2, "Back door"};
   templated.subject = "{event state}";
   templated.maxVideoSeconds = 20;
   StartWith(NotifyFile({plain, templated}, 4));

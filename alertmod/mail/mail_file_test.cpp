@@ -228,7 +228,7 @@ TEST_F(MailFileTest, SplitsBySizeLimit) {
   for (uint32_t part = 1; part <= 2; ++part) {
     std::string content = Compose(Item(), messages[part - 1], part, 2);
     EXPECT_EQ(m_mail.path, std::string(kMessagePath) + "-Part-" + std::to_string(part) + "-of-2");
-    ExpectGolden("split_part" + std::to_string(part) + ".eml", ElideAttachments(content));
+    ExpectGolden(part == 1 ? "split_first.eml" : "split_second.eml", ElideAttachments(content));
     EXPECT_EQ(MimeCheck(m_mail.path, originals[part - 1]),
               std::string(kHeaderCheck) + "header Subject: Motion on Lobby - Part " +
                   std::to_string(part) + " of 2\n" +

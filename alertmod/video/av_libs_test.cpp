@@ -187,16 +187,16 @@ class ClipLibrariesTest : public ::testing::Test {
  protected:
   void SetUp() override {
     ASSERT_TRUE(cliptest::HaveFfmpegTools()) << "ffmpeg and ffprobe needed";
-    m_frames = cliptest::MakeFrames(m_spec, m_media.path());
-    ASSERT_EQ(m_frames.size(), m_spec.frames);
-    m_clip = std::make_unique<cliptest::HostClip>(m_spec, m_frames, "HEADER", 1000, 40);
+    m_frames = cliptest::MakeFrames(m_recipe, m_media.path());
+    ASSERT_EQ(m_frames.size(), m_recipe.frames);
+    m_clip = std::make_unique<cliptest::HostClip>(m_recipe, m_frames, "HEADER", 1000, 40);
   }
 
   bool WriteClip(av_init& libs, const std::string& path) {
     return WriteVideoAttachment(1, m_clip->Stream(), path, m_host.callback(), libs);
   }
 
-  const cliptest::MediaSpec m_spec{kCodecH264, 320, 240, 10, 5};
+  const cliptest::MediaRecipe m_recipe{kCodecH264, 320, 240, 10, 5};
   testsupport::TempDir m_media;
   testsupport::FakeHost m_host;
   std::vector<cliptest::MediaFrame> m_frames;

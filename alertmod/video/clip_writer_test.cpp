@@ -14,7 +14,7 @@ namespace {
 
 using cliptest::HostClip;
 using cliptest::MediaFrame;
-using cliptest::MediaSpec;
+using cliptest::MediaRecipe;
 
 // Put in front of every payload, as the host does with its frame header. Its
 // binary fields may look like a start code, as this one does.
@@ -24,9 +24,9 @@ class ClipWriterTest : public ::testing::Test {
  protected:
   void SetUp() override { ASSERT_TRUE(cliptest::HaveFfmpegTools()) << "ffmpeg and ffprobe needed"; }
 
-  std::vector<MediaFrame> Frames(const MediaSpec& spec) {
-    std::vector<MediaFrame> frames = cliptest::MakeFrames(spec, m_dir.path());
-    EXPECT_EQ(frames.size(), spec.frames) << "test media could not be made";
+  std::vector<MediaFrame> Frames(const MediaRecipe& recipe) {
+    std::vector<MediaFrame> frames = cliptest::MakeFrames(recipe, m_dir.path());
+    EXPECT_EQ(frames.size(), recipe.frames) << "test media could not be made";
     return frames;
   }
 
@@ -63,7 +63,7 @@ std::vector<uint8_t> ExpectedPacketStart(const std::vector<uint8_t>& payload, ui
 
 TEST_F(ClipWriterTest, ClipsPlayBackWithTheirStreamDescription) {
   struct Case {
-    MediaSpec spec;
+    MediaRecipe recipe;
     const char* extension;
     const char* codecName;
   };
@@ -75,11 +75,11 @@ TEST_F(ClipWriterTest, ClipsPlayBackWithTheirStreamDescription) {
       {{kCodecMpeg4, 1280, 720, 50, 25}, ".mov", "mpeg4"},
   };
   for (const Case& c : cases) {
-    const std::string name = std::string(c.codecName) + std::to_string(c.spec.height);
+    const std::string name = std::string(c.codecName) + std::to_string(c.recipe.height);
     SCOPED_TRACE(name);
-    const std::vector<MediaFrame> frames = Frames(c.spec);
+    const std::vector<MediaFrame> frames = Frames(c.recipe);
     ASSERT_FALSE(frames.empty());
-    HostClip clip(c.spec, frames, kHostHeader, 5000, 40);
+    HostClip clip(c.recipe, frames, kHostHeader, 5000, 40);
     std::vector<std::vector<uint8_t>> before;
     for (size_t i = 0; i < frames.size(); ++i) before.push_back(clip.Buffer(i));
     const std::string path = m_dir.File(name + c.extension);
@@ -88,12 +88,12 @@ TEST_F(ClipWriterTest, ClipsPlayBackWithTheirStreamDescription) {
 
     const auto probe = cliptest::Probe(path);
     EXPECT_EQ(probe.at("codec_name"), c.codecName);
-    EXPECT_EQ(probe.at("width"), std::to_string(c.spec.width));
-    EXPECT_EQ(probe.at("height"), std::to_string(c.spec.height));
-    EXPECT_EQ(probe.at("nb_read_packets"), std::to_string(c.spec.frames));
+    EXPECT_EQ(probe.at("width"), std::to_string(c.recipe.width));
+    EXPECT_EQ(probe.at("height"), std::to_string(c.recipe.height));
+    EXPECT_EQ(probe.at("nb_read_packets"), std::to_string(c.recipe.frames));
     // 50 frames over 1960 ms play at 51000 / 1960 = 26 frames per second.
     EXPECT_EQ(probe.at("r_frame_rate"), "26/1");
-    if (c.spec.codec == kCodecH265) {
+    if (c.recipe.codec == kCodecH265) {
       EXPECT_EQ(probe.at("codec_tag_string"), "hvc1");
     }
     EXPECT_EQ(probe.count("TAG:language") ? probe.at("TAG:language") : "", "eng");
@@ -105,7 +105,7 @@ TEST_F(ClipWriterTest, ClipsPlayBackWithTheirStreamDescription) {
     EXPECT_FALSE(cliptest::ContainsBoxType(moov, "elst"));
     // Exact, not rounded down to 16-pixel units (1080 would become 1072).
     EXPECT_EQ(cliptest::TrackHeaderSize(moov),
-              std::to_string(c.spec.width) + "x" + std::to_string(c.spec.height));
+              std::to_string(c.recipe.width) + "x" + std::to_string(c.recipe.height));
     const auto boxes = cliptest::TopLevelBoxes(file);
     ASSERT_GE(boxes.size(), 3u);
     EXPECT_EQ(boxes[1].first, "moov");  // the reserved movie header comes first
@@ -115,7 +115,7 @@ TEST_F(ClipWriterTest, ClipsPlayBackWithTheirStreamDescription) {
     // Only the payload reaches the file, and the host's buffers stay as lent.
     const long offset = cliptest::FirstPacketOffset(path);
     ASSERT_GT(offset, 0);
-    const std::vector<uint8_t> expected = ExpectedPacketStart(frames[0].payload, c.spec.codec);
+    const std::vector<uint8_t> expected = ExpectedPacketStart(frames[0].payload, c.recipe.codec);
     ASSERT_GE(expected.size(), 8u);
     ASSERT_GT(file.size(), offset + expected.size());
     EXPECT_EQ(std::vector<uint8_t>(file.begin() + offset, file.begin() + offset + expected.size()),
@@ -135,13 +135,13 @@ TEST_F(ClipWriterTest, FrameRateComesFromTheArrivalSpan) {
       {"two frames 100 ms apart", {7000, 7100}, "30/1"},
       {"sparse frames still play", {7000, 12000}, "1/1"},
   };
-  const MediaSpec spec{kCodecH264, 320, 240, 2, 1};
-  const std::vector<MediaFrame> frames = Frames(spec);
+  const MediaRecipe recipe{kCodecH264, 320, 240, 2, 1};
+  const std::vector<MediaFrame> frames = Frames(recipe);
   ASSERT_EQ(frames.size(), 2u);
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
     const std::vector<MediaFrame> used(frames.begin(), frames.begin() + c.arrivals.size());
-    HostClip clip(spec, used, kHostHeader, c.arrivals);
+    HostClip clip(recipe, used, kHostHeader, c.arrivals);
     const std::string path = m_dir.File("rate.mov");
     ASSERT_TRUE(WriteVideoAttachment(1, clip.Stream(), path, m_host.callback()));
     const auto probe = cliptest::Probe(path);
@@ -152,8 +152,8 @@ TEST_F(ClipWriterTest, FrameRateComesFromTheArrivalSpan) {
 }
 
 TEST_F(ClipWriterTest, LateKeyFramesAreLoggedAndWritten) {
-  const MediaSpec spec{kCodecH264, 320, 240, 15, 5};
-  const std::vector<MediaFrame> frames = Frames(spec);
+  const MediaRecipe recipe{kCodecH264, 320, 240, 15, 5};
+  const std::vector<MediaFrame> frames = Frames(recipe);
   ASSERT_EQ(frames.size(), 15u);
   // Key frames at 0, 5 and 10; the one at 5 comes exactly 1500 ms late, the
   // one at 10 comes 1640 ms late.
@@ -163,7 +163,7 @@ TEST_F(ClipWriterTest, LateKeyFramesAreLoggedAndWritten) {
     now += i == 5 ? 1500 : i == 10 ? 1640 : 40;
     arrivals.push_back(now);
   }
-  HostClip clip(spec, frames, kHostHeader, arrivals);
+  HostClip clip(recipe, frames, kHostHeader, arrivals);
   const std::string path = m_dir.File("gap.mov");
   ASSERT_TRUE(WriteVideoAttachment(4, clip.Stream(), path, m_host.callback()));
 
@@ -175,10 +175,10 @@ TEST_F(ClipWriterTest, LateKeyFramesAreLoggedAndWritten) {
 }
 
 TEST_F(ClipWriterTest, ArrivalTicksThatWrapKeepTheWholeClip) {
-  const MediaSpec spec{kCodecH264, 320, 240, 25, 25};
-  const std::vector<MediaFrame> frames = Frames(spec);
+  const MediaRecipe recipe{kCodecH264, 320, 240, 25, 25};
+  const std::vector<MediaFrame> frames = Frames(recipe);
   // The eleventh frame arrives at tick 0 exactly.
-  HostClip clip(spec, frames, kHostHeader, 0u - 400u, 40);
+  HostClip clip(recipe, frames, kHostHeader, 0u - 400u, 40);
   const std::string path = m_dir.File("wrap.mov");
   ASSERT_TRUE(WriteVideoAttachment(2, clip.Stream(), path, m_host.callback()));
   EXPECT_EQ(cliptest::Probe(path).at("nb_read_packets"), "25");
@@ -188,8 +188,8 @@ TEST_F(ClipWriterTest, ArrivalTicksThatWrapKeepTheWholeClip) {
 TEST_F(ClipWriterTest, CodecsWithoutAContainerAreRefused) {
   for (uint32_t codec : {kCodecJpeg, 3u, 7u}) {
     SCOPED_TRACE(codec);
-    MediaSpec spec{codec, 320, 240, 1, 1};
-    HostClip clip(spec, {MediaFrame{{1, 2, 3}, true}}, kHostHeader, 100, 40);
+    MediaRecipe recipe{codec, 320, 240, 1, 1};
+    HostClip clip(recipe, {MediaFrame{{1, 2, 3}, true}}, kHostHeader, 100, 40);
     const std::string path = m_dir.File("refused.mov");
     EXPECT_FALSE(WriteVideoAttachment(2, clip.Stream(), path, m_host.callback()));
     EXPECT_FALSE(testsupport::FileExists(path));
@@ -198,9 +198,9 @@ TEST_F(ClipWriterTest, CodecsWithoutAContainerAreRefused) {
 }
 
 TEST_F(ClipWriterTest, FilesThatCannotBeStartedAreLogged) {
-  const MediaSpec spec{kCodecH264, 320, 240, 10, 5};
-  const std::vector<MediaFrame> frames = Frames(spec);
-  HostClip clip(spec, frames, kHostHeader, 100, 40);
+  const MediaRecipe recipe{kCodecH264, 320, 240, 10, 5};
+  const std::vector<MediaFrame> frames = Frames(recipe);
+  HostClip clip(recipe, frames, kHostHeader, 100, 40);
   for (const std::string& path : {m_dir.File("missing/clip.mov"), m_dir.File("clip.unknown")}) {
     SCOPED_TRACE(path);
     EXPECT_TRUE(WriteVideoAttachment(12, clip.Stream(), path, m_host.callback()));
@@ -220,10 +220,10 @@ TEST_F(ClipWriterTest, FilesThatCannotBeStartedAreLogged) {
 TEST_F(ClipWriterTest, ClipsTooLongForTheReservedHeaderLeaveNoBrokenFile) {
   // Many short groups of pictures outgrow the 16352 bytes kept for the
   // movie header; the container then cannot be finished.
-  const MediaSpec spec{kCodecH264, 64, 64, 3600, 2};
-  const std::vector<MediaFrame> frames = Frames(spec);
+  const MediaRecipe recipe{kCodecH264, 64, 64, 3600, 2};
+  const std::vector<MediaFrame> frames = Frames(recipe);
   ASSERT_EQ(frames.size(), 3600u);
-  HostClip clip(spec, frames, kHostHeader, 100, 33);
+  HostClip clip(recipe, frames, kHostHeader, 100, 33);
   const std::string path = m_dir.File("long.mov");
   EXPECT_TRUE(WriteVideoAttachment(5, clip.Stream(), path, m_host.callback()));
   EXPECT_FALSE(testsupport::FileExists(path));
@@ -238,8 +238,9 @@ TEST_F(ClipWriterTest, JpegStillIsThePayloadOfTheFirstFrame) {
                        &status);
   ASSERT_EQ(status, 0);
   const std::vector<uint8_t> still = cliptest::ReadBytes(source);
-  MediaSpec spec{kCodecJpeg, 320, 240, 2, 1};
-  HostClip clip(spec, {MediaFrame{still, true}, MediaFrame{{9, 9, 9}, true}}, kHostHeader, 100, 40);
+  MediaRecipe recipe{kCodecJpeg, 320, 240, 2, 1};
+  HostClip clip(recipe, {MediaFrame{still, true}, MediaFrame{{9, 9, 9}, true}}, kHostHeader, 100,
+                40);
   const std::string path = m_dir.File("attachment.jpg");
   ASSERT_TRUE(WriteJpegAttachment(clip.Stream(), path));
   EXPECT_EQ(cliptest::ReadBytes(path), still);
@@ -247,12 +248,12 @@ TEST_F(ClipWriterTest, JpegStillIsThePayloadOfTheFirstFrame) {
 }
 
 TEST_F(ClipWriterTest, JpegStillFailures) {
-  MediaSpec spec{kCodecJpeg, 320, 240, 1, 1};
+  MediaRecipe recipe{kCodecJpeg, 320, 240, 1, 1};
   const std::vector<uint8_t> still = {0xFF, 0xD8, 0xFF, 0xD9};
-  HostClip empty(spec, {}, kHostHeader, 100, 40);
-  HostClip good(spec, {MediaFrame{still, true}}, kHostHeader, 100, 40);
-  HostClip headerOnly(spec, {MediaFrame{{}, true}}, kHostHeader, 100, 40);
-  HostClip taken(spec, {MediaFrame{still, true}}, kHostHeader, 100, 40);
+  HostClip empty(recipe, {}, kHostHeader, 100, 40);
+  HostClip good(recipe, {MediaFrame{still, true}}, kHostHeader, 100, 40);
+  HostClip headerOnly(recipe, {MediaFrame{{}, true}}, kHostHeader, 100, 40);
+  HostClip taken(recipe, {MediaFrame{still, true}}, kHostHeader, 100, 40);
   taken.ClearBuffer(0);
   struct Case {
     const char* name;

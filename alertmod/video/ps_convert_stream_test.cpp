@@ -59,8 +59,8 @@ class StreamMuxerTest : public ::testing::Test {
 };
 
 TEST_F(StreamMuxerTest, PacketsWaitForTheParameterSets) {
-  const cliptest::MediaSpec spec{kCodecH264, 320, 240, 20, 10};
-  std::vector<cliptest::MediaFrame> frames = cliptest::MakeFrames(spec, m_dir.path());
+  const cliptest::MediaRecipe recipe{kCodecH264, 320, 240, 20, 10};
+  std::vector<cliptest::MediaFrame> frames = cliptest::MakeFrames(recipe, m_dir.path());
   ASSERT_EQ(frames.size(), 20u);
   // Only the second key frame carries the parameter sets.
   frames[0].payload = WithoutParameterSets(frames[0].payload);
@@ -126,8 +126,8 @@ TEST_F(StreamMuxerTest, DescribesItsStreams) {
 }
 
 TEST_F(StreamMuxerTest, ARefusedHeaderIsNotRetried) {
-  const cliptest::MediaSpec spec{kCodecH264, 320, 240, 3, 3};
-  const std::vector<cliptest::MediaFrame> frames = cliptest::MakeFrames(spec, m_dir.path());
+  const cliptest::MediaRecipe recipe{kCodecH264, 320, 240, 3, 3};
+  const std::vector<cliptest::MediaFrame> frames = cliptest::MakeFrames(recipe, m_dir.path());
   ASSERT_EQ(frames.size(), 3u);
   PSConvertAVCodecStream muxer;
   muxer.SetOptions({{"moov_size", "not a number", 0}});

@@ -60,13 +60,13 @@ const char kUsage[] =
     "exit status: 0 success; 1 the run, test or check failed; 2 a usage error or\n"
     "unreadable input.\n";
 
-struct CommandSpec {
+struct CommandInfo {
   const char* name;
   Command command;
   size_t arguments;
 };
 
-constexpr CommandSpec kCommands[] = {
+constexpr CommandInfo kCommands[] = {
     {"help", Command::kHelp, 0},
     {"run", Command::kRun, 1},
     {"validate", Command::kValidate, 1},
@@ -88,7 +88,7 @@ enum : unsigned {
 
 using Apply = bool (*)(const std::string& value, CommandLine* line);
 
-struct OptionSpec {
+struct OptionInfo {
   const char* name;
   bool takesValue;
   unsigned commands;
@@ -137,7 +137,7 @@ bool ApplyTimeout(const std::string& value, CommandLine* line) {
   return !value.empty() && *end == '\0' && line->timeoutSeconds > 0;
 }
 
-const OptionSpec kOptions[] = {
+const OptionInfo kOptions[] = {
     {"--module", true, kAll, "",
      [](const std::string& v, CommandLine* l) { return !(l->host.modulePath = v).empty(); }},
     {"--workdir", true, kAllButValidate, "every command but validate",
@@ -166,15 +166,15 @@ const OptionSpec kOptions[] = {
     {"--timeout", true, kForTest, "test-profile", ApplyTimeout},
 };
 
-const OptionSpec* FindOption(const std::string& name) {
-  for (const OptionSpec& option : kOptions) {
+const OptionInfo* FindOption(const std::string& name) {
+  for (const OptionInfo& option : kOptions) {
     if (name == option.name) return &option;
   }
   return nullptr;
 }
 
-const CommandSpec* FindCommand(const std::string& name) {
-  for (const CommandSpec& command : kCommands) {
+const CommandInfo* FindCommand(const std::string& name) {
+  for (const CommandInfo& command : kCommands) {
     if (name == command.name) return &command;
   }
   return nullptr;
@@ -182,7 +182,7 @@ const CommandSpec* FindCommand(const std::string& name) {
 
 // Reads the option at words[*i] (and its value); advances *i past them.
 bool ReadOption(const std::vector<std::string>& words, size_t* i, CommandLine* line,
-                std::vector<const OptionSpec*>* given, std::string* error) {
+                std::vector<const OptionInfo*>* given, std::string* error) {
   std::string name = words[*i];
   std::string value;
   const size_t equals = name.find('=');
@@ -191,7 +191,7 @@ bool ReadOption(const std::vector<std::string>& words, size_t* i, CommandLine* l
     value = name.substr(equals + 1);
     name.resize(equals);
   }
-  const OptionSpec* option = FindOption(name);
+  const OptionInfo* option = FindOption(name);
   if (option == nullptr) {
     *error = "unknown option " + name;
     return false;
@@ -214,10 +214,10 @@ bool ReadOption(const std::vector<std::string>& words, size_t* i, CommandLine* l
   return true;
 }
 
-bool CheckCommand(const CommandLine& line, const CommandSpec& command,
-                  const std::vector<const OptionSpec*>& given, std::string* error) {
+bool CheckCommand(const CommandLine& line, const CommandInfo& command,
+                  const std::vector<const OptionInfo*>& given, std::string* error) {
   const unsigned bit = 1u << static_cast<int>(line.command);
-  for (const OptionSpec* option : given) {
+  for (const OptionInfo* option : given) {
     if ((option->commands & bit) == 0) {
       *error = std::string(option->name) + " is an option of " + option->owner + ", not of " +
                command.name;
@@ -256,8 +256,8 @@ bool ParseCommandLine(const std::vector<std::string>& words, CommandLine* line,
                       std::string* error) {
   *line = CommandLine();
   line->host.modulePath = DefaultModulePath();
-  std::vector<const OptionSpec*> given;
-  const CommandSpec* command = nullptr;
+  std::vector<const OptionInfo*> given;
+  const CommandInfo* command = nullptr;
   for (size_t i = 0; i < words.size(); ++i) {
     const std::string& word = words[i];
     if (word == "--help" || word == "-h") {

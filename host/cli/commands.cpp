@@ -109,8 +109,8 @@ int ServeCommand(const CommandLine& line) {
     scenario.rawFeeds.push_back(scenario::RawFeed{id, AbsolutePath(file), !line.fastFeeds});
   }
   if (!line.updateFile.empty()) {
-    scenario.config.source = scenario::ConfigSpec::Source::kFile;
-    scenario.config.delivery = scenario::ConfigSpec::Delivery::kUpdate;
+    scenario.config.source = scenario::ConfigSetting::Source::kFile;
+    scenario.config.delivery = scenario::ConfigSetting::Delivery::kUpdate;
     scenario.config.file = AbsolutePath(line.updateFile);
   }
   TimelineEntry stop;

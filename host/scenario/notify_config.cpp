@@ -23,7 +23,7 @@ void SetIfGiven(TiXmlElement* element, const char* name, const std::optional<T>&
   if (value) element->SetAttribute(name, static_cast<int>(*value));
 }
 
-void AddServer(TiXmlElement* servers, const SmtpServerSpec& server) {
+void AddServer(TiXmlElement* servers, const SmtpServerSetting& server) {
   TiXmlElement* smtp = AddChild(servers, "smtp");
   smtp->SetAttribute("description", server.description);
   smtp->SetAttribute("address", server.address);
@@ -35,7 +35,7 @@ void AddServer(TiXmlElement* servers, const SmtpServerSpec& server) {
   authentication->SetAttribute("password", server.password);
 }
 
-void AddProfile(TiXmlElement* profiles, const ProfileSpec& profile) {
+void AddProfile(TiXmlElement* profiles, const ProfileSetting& profile) {
   TiXmlElement* smtp = AddChild(profiles, "smtp");
   smtp->SetAttribute("ID", profile.id);
   if (profile.attach) smtp->SetAttribute("attach", *profile.attach ? 1 : 0);
@@ -56,7 +56,7 @@ void AddProfile(TiXmlElement* profiles, const ProfileSpec& profile) {
   }
 }
 
-std::unique_ptr<TiXmlElement> NotifyElement(const ConfigSpec& config) {
+std::unique_ptr<TiXmlElement> NotifyElement(const ConfigSetting& config) {
   auto notify = std::make_unique<TiXmlElement>("Notify");
   notify->SetAttribute("ID", kAlertModuleId);
   SetIfGiven(notify.get(), "MaxRetrySeconds", config.maxRetrySeconds);
@@ -64,18 +64,18 @@ std::unique_ptr<TiXmlElement> NotifyElement(const ConfigSpec& config) {
   SetIfGiven(notify.get(), "EmailSizeLimitMB", config.emailSizeLimitMb);
   if (config.webAddress) AddChild(notify.get(), "Web")->SetAttribute("address", *config.webAddress);
   TiXmlElement* servers = AddChild(notify.get(), "Servers");
-  for (const SmtpServerSpec& server : config.servers) AddServer(servers, server);
+  for (const SmtpServerSetting& server : config.servers) AddServer(servers, server);
   TiXmlElement* profiles = AddChild(notify.get(), "Profiles");
   int32_t next = 1;
-  for (const ProfileSpec& profile : config.profiles) next = std::max(next, profile.id + 1);
+  for (const ProfileSetting& profile : config.profiles) next = std::max(next, profile.id + 1);
   profiles->SetAttribute("autoincrement", next);
-  for (const ProfileSpec& profile : config.profiles) AddProfile(profiles, profile);
+  for (const ProfileSetting& profile : config.profiles) AddProfile(profiles, profile);
   return notify;
 }
 
 }  // namespace
 
-std::string ProfileBody(const ProfileSpec& profile) {
+std::string ProfileBody(const ProfileSetting& profile) {
   std::string body;
   for (size_t i = 0; i < profile.bodyLines.size(); ++i) {
     if (i > 0) body += "\r\n";
@@ -88,7 +88,7 @@ std::string ProfileBody(const ProfileSpec& profile) {
   return body;
 }
 
-std::string NotifyFileText(const ConfigSpec& config) {
+std::string NotifyFileText(const ConfigSetting& config) {
   TiXmlDocument document;
   document.LinkEndChild(new TiXmlDeclaration("", "", ""));
   auto trellan = std::make_unique<TiXmlElement>("Trellan");
@@ -101,7 +101,7 @@ std::string NotifyFileText(const ConfigSpec& config) {
   return printer.Str();
 }
 
-std::string NotifyElementText(const ConfigSpec& config) {
+std::string NotifyElementText(const ConfigSetting& config) {
   std::string text;
   text << *NotifyElement(config);
   return text;

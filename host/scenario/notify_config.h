@@ -16,13 +16,13 @@ namespace refhost::scenario {
 
 // The text of a "notify.xml" file: declaration, "Trellan" with Delta 0 and
 // the "Notify" element, indented.
-std::string NotifyFileText(const ConfigSpec& config);
+std::string NotifyFileText(const ConfigSetting& config);
 
 // The "Notify" element alone, compact, for a configuration update.
-std::string NotifyElementText(const ConfigSpec& config);
+std::string NotifyElementText(const ConfigSetting& config);
 
 // A profile's body: its lines joined with CR LF, as mail bodies are written.
-std::string ProfileBody(const ProfileSpec& profile);
+std::string ProfileBody(const ProfileSetting& profile);
 
 }  // namespace refhost::scenario
 

@@ -18,7 +18,7 @@
 namespace refhost::scenario {
 
 // One video stream of a camera and the file that plays it, if any.
-struct StreamSpec {
+struct StreamSetting {
   StreamDescription description;
   // Codec, width and height were written in the scenario. Otherwise they are
   // taken from the feed's file when the run starts.
@@ -27,12 +27,12 @@ struct StreamSpec {
   int line = 0;
 };
 
-struct CameraSpec {
+struct CameraSetting {
   std::string name;
   int32_t plugin = 0x10000;
   int32_t device = 1;
   int32_t input = 0;
-  std::vector<StreamSpec> streams;  // the main stream (context 0) first
+  std::vector<StreamSetting> streams;  // the main stream (context 0) first
   int line = 0;
 };
 
@@ -43,7 +43,7 @@ struct RawFeed {
   bool realTime = true;
 };
 
-struct SmtpServerSpec {
+struct SmtpServerSetting {
   std::string description;
   std::string address;
   std::optional<int32_t> port;
@@ -52,7 +52,7 @@ struct SmtpServerSpec {
   std::string password;
 };
 
-struct ProfileSpec {
+struct ProfileSetting {
   int32_t id = 0;
   std::string description;
   std::string from;
@@ -67,7 +67,7 @@ struct ProfileSpec {
   std::optional<int32_t> throttleSeconds;
 };
 
-struct ConfigSpec {
+struct ConfigSetting {
   enum class Source {
     kWorkingDirectory,  // whatever notify.xml the working directory holds
     kInline,            // the "limits", "web", "smtp" and "profile" lines
@@ -85,12 +85,12 @@ struct ConfigSpec {
   std::optional<int32_t> maxRetryQueue;
   std::optional<int32_t> emailSizeLimitMb;
   std::optional<std::string> webAddress;
-  std::vector<SmtpServerSpec> servers;
-  std::vector<ProfileSpec> profiles;
+  std::vector<SmtpServerSetting> servers;
+  std::vector<ProfileSetting> profiles;
 };
 
 // What the runner waits for before the timeline goes on.
-struct WaitSpec {
+struct WaitSetting {
   int reports = 0;                 // delivery status reports (0 or 1) seen in all
   std::optional<int32_t> profile;  // count only this profile's reports
   std::string logText;             // a module log line containing this text
@@ -106,20 +106,20 @@ struct TimelineEntry {
   // kAlarm: the requests of one alarm document ("Time" is set when sent).
   std::vector<AlarmRequest> requests;
   bool test = false;  // the requests are test notifications
-  WaitSpec wait;
+  WaitSetting wait;
 };
 
 struct Scenario {
   std::string name;  // the file it came from, for messages
   std::optional<std::string> serverSerial;
   std::optional<std::string> serverDescription;
-  std::vector<CameraSpec> cameras;
+  std::vector<CameraSetting> cameras;
   // Everything else the system document describes: devices, triggers,
   // source groups and event definitions. Cameras are added at run time,
   // once the feeds' formats are known.
   SystemDescription system;
   std::vector<RawFeed> rawFeeds;
-  ConfigSpec config;
+  ConfigSetting config;
   std::vector<TimelineEntry> timeline;  // in time order
 
   // Whether a system document is to be sent.

@@ -189,8 +189,8 @@ class Parser {
   }
 
   // The stream attributes of "camera" and "stream": feed, codec, width, height.
-  StreamSpec ReadStream(Directive& d, int32_t context) {
-    StreamSpec stream;
+  StreamSetting ReadStream(Directive& d, int32_t context) {
+    StreamSetting stream;
     stream.line = m_line;
     stream.description.context = context;
     if (std::optional<std::string> feed = d.Text("feed")) stream.feed = ResolvePath(*feed);
@@ -219,7 +219,7 @@ class Parser {
   }
 
   void Camera(Directive& d) {
-    CameraSpec camera;
+    CameraSetting camera;
     std::optional<std::string> name = d.Word(0, "camera name");
     ReadDevice(d, &camera.plugin, &camera.device);
     camera.input = d.Integer("input", 0, kByteMax).value_or(camera.input);
@@ -228,7 +228,7 @@ class Parser {
     if (d.failed() || !NameIsFree(d, *name)) return;
     camera.name = *name;
     camera.line = m_line;
-    for (const CameraSpec& other : m_result.scenario.cameras) {
+    for (const CameraSetting& other : m_result.scenario.cameras) {
       if (other.plugin == camera.plugin && other.device == camera.device &&
           other.input == camera.input) {
         return d.Fault("camera \"" + other.name + "\" already has this plugin, device and input");
@@ -238,7 +238,7 @@ class Parser {
     m_result.scenario.cameras.push_back(std::move(camera));
   }
 
-  CameraSpec* FindCamera(Directive& d, const std::string& name) {
+  CameraSetting* FindCamera(Directive& d, const std::string& name) {
     const auto found = m_cameras.find(name);
     if (found != m_cameras.end()) return &m_result.scenario.cameras[found->second];
     d.Fault("unknown camera \"" + name + "\"");
@@ -250,11 +250,11 @@ class Parser {
     std::optional<int32_t> context = d.Integer("context", 1, kMaxContext);
     if (!d.Has("context")) d.Fault("stream needs context= (1 to 15)");
     std::optional<int32_t> number = d.Integer("number", -1, kByteMax);
-    StreamSpec stream = ReadStream(d, context.value_or(1));
+    StreamSetting stream = ReadStream(d, context.value_or(1));
     d.Finish(1);
-    CameraSpec* camera = name ? FindCamera(d, *name) : nullptr;
+    CameraSetting* camera = name ? FindCamera(d, *name) : nullptr;
     if (d.failed() || camera == nullptr) return;
-    for (const StreamSpec& other : camera->streams) {
+    for (const StreamSetting& other : camera->streams) {
       if (other.description.context == *context)
         return d.Fault("camera \"" + *name + "\" already has a stream at context " +
                        std::to_string(*context));
@@ -279,13 +279,13 @@ class Parser {
   // A camera's or a trigger's name as a source.
   std::optional<SourceRef> NamedSource(Directive& d, const std::string& name) {
     if (const auto camera = m_cameras.find(name); camera != m_cameras.end()) {
-      const CameraSpec& spec = m_result.scenario.cameras[camera->second];
-      return SourceRef{SourceRef::Kind::kCamera, spec.plugin, spec.device, spec.input, name};
+      const CameraSetting& found = m_result.scenario.cameras[camera->second];
+      return SourceRef{SourceRef::Kind::kCamera, found.plugin, found.device, found.input, name};
     }
     if (const auto trigger = m_triggers.find(name); trigger != m_triggers.end()) {
-      const TriggerDescription& spec = m_result.scenario.system.triggers[trigger->second];
-      if (spec.output) d.Fault("\"" + name + "\" is an output, not an event source");
-      return SourceRef{SourceRef::Kind::kTrigger, spec.plugin, spec.device, spec.number, name};
+      const TriggerDescription& found = m_result.scenario.system.triggers[trigger->second];
+      if (found.output) d.Fault("\"" + name + "\" is an output, not an event source");
+      return SourceRef{SourceRef::Kind::kTrigger, found.plugin, found.device, found.number, name};
     }
     d.Fault("unknown camera or trigger \"" + name + "\"");
     return std::nullopt;
@@ -386,9 +386,9 @@ class Parser {
 
   // ---- the module's configuration -------------------------------------
 
-  ConfigSpec& InlineConfig(Directive& d) {
-    ConfigSpec& config = m_result.scenario.config;
-    if (config.source == ConfigSpec::Source::kFile) {
+  ConfigSetting& InlineConfig(Directive& d) {
+    ConfigSetting& config = m_result.scenario.config;
+    if (config.source == ConfigSetting::Source::kFile) {
       d.Fault("configuration lines cannot be mixed with config-file");
     }
     return config;
@@ -399,9 +399,9 @@ class Parser {
     std::optional<int32_t> retryQueue = d.Integer("retry-queue", 0, kMaxId);
     std::optional<int32_t> sizeLimit = d.Integer("size-limit-mb", 0, kMaxSizeLimitMb);
     d.Finish(0);
-    ConfigSpec& config = InlineConfig(d);
+    ConfigSetting& config = InlineConfig(d);
     if (d.failed()) return;
-    config.source = ConfigSpec::Source::kInline;
+    config.source = ConfigSetting::Source::kInline;
     if (retrySeconds) config.maxRetrySeconds = retrySeconds;
     if (retryQueue) config.maxRetryQueue = retryQueue;
     if (sizeLimit) config.emailSizeLimitMb = sizeLimit;
@@ -410,14 +410,14 @@ class Parser {
   void Web(Directive& d) {
     std::optional<std::string> address = d.Word(0, "web server address");
     d.Finish(1);
-    ConfigSpec& config = InlineConfig(d);
+    ConfigSetting& config = InlineConfig(d);
     if (d.failed()) return;
-    config.source = ConfigSpec::Source::kInline;
+    config.source = ConfigSetting::Source::kInline;
     config.webAddress = address;
   }
 
   void Smtp(Directive& d) {
-    SmtpServerSpec server;
+    SmtpServerSetting server;
     std::optional<std::string> name = d.Word(0, "server name");
     std::optional<std::string> address = d.Text("address");
     if (!address) d.Fault("smtp needs address=");
@@ -426,16 +426,16 @@ class Parser {
     server.user = d.Text("user").value_or("");
     server.password = d.Text("password").value_or("");
     d.Finish(1);
-    ConfigSpec& config = InlineConfig(d);
+    ConfigSetting& config = InlineConfig(d);
     if (d.failed()) return;
     server.description = *name;
     server.address = *address;
-    config.source = ConfigSpec::Source::kInline;
+    config.source = ConfigSetting::Source::kInline;
     config.servers.push_back(server);
   }
 
   void Profile(Directive& d) {
-    ProfileSpec profile;
+    ProfileSetting profile;
     std::optional<int32_t> id = d.IntegerWord(0, "profile number", 1, kMaxId);
     std::optional<std::string> name = d.Word(1, "profile name");
     std::optional<std::string> from = d.Text("from");
@@ -450,14 +450,14 @@ class Parser {
     profile.eventEdge = NamedValue(d, "edge", Vocabulary::kEdge, false);
     profile.throttleSeconds = d.Integer("throttle", 0, kMaxId);
     d.Finish(2);
-    ConfigSpec& config = InlineConfig(d);
+    ConfigSetting& config = InlineConfig(d);
     if (d.failed()) return;
     if (m_profiles.count(*id) != 0)
       return d.Fault("profile " + std::to_string(*id) + " is defined twice");
     profile.id = *id;
     profile.description = *name;
     profile.from = *from;
-    config.source = ConfigSpec::Source::kInline;
+    config.source = ConfigSetting::Source::kInline;
     m_profiles[*id] = config.profiles.size();
     config.profiles.push_back(std::move(profile));
   }
@@ -475,14 +475,14 @@ class Parser {
   void ConfigFile(Directive& d) {
     std::optional<std::string> path = d.Word(0, "configuration file");
     d.Finish(1);
-    ConfigSpec& config = m_result.scenario.config;
-    if (config.source == ConfigSpec::Source::kInline) {
+    ConfigSetting& config = m_result.scenario.config;
+    if (config.source == ConfigSetting::Source::kInline) {
       d.Fault("config-file cannot be mixed with configuration lines");
-    } else if (config.source == ConfigSpec::Source::kFile) {
+    } else if (config.source == ConfigSetting::Source::kFile) {
       d.Fault("config-file is given twice");
     }
     if (d.failed()) return;
-    config.source = ConfigSpec::Source::kFile;
+    config.source = ConfigSetting::Source::kFile;
     config.file = ResolvePath(*path);
   }
 
@@ -491,9 +491,9 @@ class Parser {
     d.Finish(1);
     if (d.failed()) return;
     if (*how == "notify.xml") {
-      m_result.scenario.config.delivery = ConfigSpec::Delivery::kBeforeOpen;
+      m_result.scenario.config.delivery = ConfigSetting::Delivery::kBeforeOpen;
     } else if (*how == "update") {
-      m_result.scenario.config.delivery = ConfigSpec::Delivery::kUpdate;
+      m_result.scenario.config.delivery = ConfigSetting::Delivery::kUpdate;
     } else {
       d.Fault("config-as takes notify.xml or update, not \"" + *how + "\"");
     }
@@ -621,7 +621,7 @@ class Parser {
 
   void Wait(Directive& d, TimelineEntry* entry) {
     entry->kind = TimelineEntry::Kind::kWait;
-    WaitSpec& wait = entry->wait;
+    WaitSetting& wait = entry->wait;
     wait.reports = d.Integer("reports", 1, kMaxId).value_or(0);
     wait.profile = d.Integer("profile", 1, kMaxId);
     wait.logText = d.Text("log").value_or("");

@@ -74,16 +74,16 @@ bool ScenarioRunner::WriteTextFile(const std::string& path, const std::string& t
 }
 
 bool ScenarioRunner::PrepareConfiguration() {
-  const ConfigSpec& config = m_scenario.config;
+  const ConfigSetting& config = m_scenario.config;
   std::string text;
   switch (config.source) {
-    case ConfigSpec::Source::kWorkingDirectory:
+    case ConfigSetting::Source::kWorkingDirectory:
       return true;
-    case ConfigSpec::Source::kInline:
-      text = config.delivery == ConfigSpec::Delivery::kUpdate ? NotifyElementText(config)
-                                                              : NotifyFileText(config);
+    case ConfigSetting::Source::kInline:
+      text = config.delivery == ConfigSetting::Delivery::kUpdate ? NotifyElementText(config)
+                                                                 : NotifyFileText(config);
       break;
-    case ConfigSpec::Source::kFile: {
+    case ConfigSetting::Source::kFile: {
       bool ok = false;
       text = ReadTextFile(config.file, &ok);
       if (!ok) {
@@ -93,7 +93,7 @@ bool ScenarioRunner::PrepareConfiguration() {
       break;
     }
   }
-  if (config.delivery == ConfigSpec::Delivery::kUpdate) {
+  if (config.delivery == ConfigSetting::Delivery::kUpdate) {
     m_update = text;
     return true;
   }
@@ -120,8 +120,8 @@ bool ScenarioRunner::OpenFeed(const std::string& label, uint32_t streamId, const
 }
 
 bool ScenarioRunner::OpenFeeds() {
-  for (CameraSpec& camera : m_cameras) {
-    for (StreamSpec& stream : camera.streams) {
+  for (CameraSetting& camera : m_cameras) {
+    for (StreamSetting& stream : camera.streams) {
       if (stream.feed.empty()) continue;
       const int32_t context = stream.description.context;
       const std::string label =
@@ -147,13 +147,13 @@ bool ScenarioRunner::OpenFeeds() {
 
 SystemDescription ScenarioRunner::BuildSystem() const {
   SystemDescription system = m_scenario.system;
-  for (const CameraSpec& camera : m_cameras) {
+  for (const CameraSetting& camera : m_cameras) {
     CameraDescription description;
     description.name = camera.name;
     description.plugin = camera.plugin;
     description.device = camera.device;
     description.input = camera.input;
-    for (const StreamSpec& stream : camera.streams)
+    for (const StreamSetting& stream : camera.streams)
       description.streams.push_back(stream.description);
     system.cameras.push_back(description);
   }
@@ -240,7 +240,7 @@ void ScenarioRunner::SendAlarm(const TimelineEntry& entry) {
   m_host->WriteDocument(BuildAlarmDocument(alarm), kAlarmSender);
 }
 
-bool ScenarioRunner::ConditionHolds(const WaitSpec& wait, int* reports) const {
+bool ScenarioRunner::ConditionHolds(const WaitSetting& wait, int* reports) const {
   *reports = 0;
   for (const ProfileStatusReport& status : m_host->Config().StatusReports()) {
     const bool delivery = status.status == 0 || status.status == 1;
@@ -251,7 +251,7 @@ bool ScenarioRunner::ConditionHolds(const WaitSpec& wait, int* reports) const {
 }
 
 void ScenarioRunner::AwaitCondition(const TimelineEntry& entry) {
-  const WaitSpec& wait = entry.wait;
+  const WaitSetting& wait = entry.wait;
   std::string what;
   if (wait.reports > 0) {
     what = std::to_string(wait.reports) + " delivery report(s)" +

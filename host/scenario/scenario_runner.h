@@ -57,7 +57,7 @@ class ScenarioRunner {
   void PlayTimeline();
   void SendAlarm(const TimelineEntry& entry);
   void AwaitCondition(const TimelineEntry& entry);
-  bool ConditionHolds(const WaitSpec& wait, int* reports) const;
+  bool ConditionHolds(const WaitSetting& wait, int* reports) const;
   std::string Progress() const;
   void Finish();
   void Fail(std::string problem);
@@ -65,8 +65,8 @@ class ScenarioRunner {
   const Scenario& m_scenario;
   HostOptions m_options;
   Console& m_console;
-  std::vector<CameraSpec> m_cameras;  // the scenario's, formats filled from the feeds
-  std::string m_update;               // a configuration update to send after Open
+  std::vector<CameraSetting> m_cameras;  // the scenario's, formats filled from the feeds
+  std::string m_update;                  // a configuration update to send after Open
   std::unique_ptr<ReferenceHost> m_host;
   std::vector<Feed> m_feeds;
   std::chrono::steady_clock::time_point m_start;

@@ -77,9 +77,9 @@ std::vector<MediaFrame> SplitAtPictures(const std::vector<uint8_t>& stream) {
   return frames;
 }
 
-std::string EncoderArguments(const MediaSpec& spec) {
-  const std::string gop = std::to_string(spec.gop);
-  switch (spec.codec) {
+std::string EncoderArguments(const MediaRecipe& recipe) {
+  const std::string gop = std::to_string(recipe.gop);
+  switch (recipe.codec) {
     case hx::kCodecH265:
       return "-c:v libx265 -preset ultrafast -x265-params aud=1:keyint=" + gop +
              ":min-keyint=" + gop + ":bframes=0:log-level=error -f hevc";
@@ -115,25 +115,25 @@ bool HaveFfmpegTools() {
   return ffmpegStatus == 0 && ffprobeStatus == 0;
 }
 
-std::vector<MediaFrame> MakeFrames(const MediaSpec& spec, const std::string& directory) {
+std::vector<MediaFrame> MakeFrames(const MediaRecipe& recipe, const std::string& directory) {
   const std::string output = directory + "/source.es";
   std::ostringstream command;
-  command << "ffmpeg -v error -y -f lavfi -i testsrc2=size=" << spec.width << "x" << spec.height
-          << ":rate=25 -frames:v " << spec.frames << " -pix_fmt yuv420p " << EncoderArguments(spec)
-          << " " << output;
+  command << "ffmpeg -v error -y -f lavfi -i testsrc2=size=" << recipe.width << "x" << recipe.height
+          << ":rate=25 -frames:v " << recipe.frames << " -pix_fmt yuv420p "
+          << EncoderArguments(recipe) << " " << output;
   int status = -1;
   RunCommand(command.str(), &status);
   if (status != 0) return {};
-  return SplitFrames(ReadBytes(output), spec.codec);
+  return SplitFrames(ReadBytes(output), recipe.codec);
 }
 
 std::vector<MediaFrame> SplitFrames(const std::vector<uint8_t>& stream, uint32_t codec) {
   return codec == hx::kCodecMpeg4 ? SplitAtPictures(stream) : SplitAtDelimiters(stream, codec);
 }
 
-HostClip::HostClip(const MediaSpec& spec, const std::vector<MediaFrame>& frames,
+HostClip::HostClip(const MediaRecipe& recipe, const std::vector<MediaFrame>& frames,
                    const std::string& header, uint32_t startMs, uint32_t intervalMs)
-    : HostClip(spec, frames, header, [&] {
+    : HostClip(recipe, frames, header, [&] {
         std::vector<uint32_t> times;
         for (size_t i = 0; i < frames.size(); ++i) {
           times.push_back(startMs + static_cast<uint32_t>(i) * intervalMs);
@@ -141,13 +141,13 @@ HostClip::HostClip(const MediaSpec& spec, const std::vector<MediaFrame>& frames,
         return times;
       }()) {}
 
-HostClip::HostClip(const MediaSpec& spec, const std::vector<MediaFrame>& frames,
+HostClip::HostClip(const MediaRecipe& recipe, const std::vector<MediaFrame>& frames,
                    const std::string& header, const std::vector<uint32_t>& arrivalMs)
     : m_headerSize(header.size()) {
   hx::StreamFormat format;
-  format.width = spec.width;
-  format.height = spec.height;
-  format.codec = spec.codec;
+  format.width = recipe.width;
+  format.height = recipe.height;
+  format.codec = recipe.codec;
   const uint32_t trigger = arrivalMs.empty() ? 0 : arrivalMs.front();
   // Limits far beyond any test clip, so that every frame offered is kept.
   m_stream = std::make_unique<hx::CVideoEmailStream>(format, uint64_t{1} << 40, trigger,

@@ -24,7 +24,7 @@ struct MediaFrame {
   bool key = false;
 };
 
-struct MediaSpec {
+struct MediaRecipe {
   uint32_t codec = hx::kCodecH264;  // host codec code: 4, 5 or 6
   uint32_t width = 1280;
   uint32_t height = 720;
@@ -40,7 +40,7 @@ bool HaveFfmpegTools();
 
 // Encodes a test pattern as a raw elementary stream into `directory` and
 // splits it into frames. Empty on failure.
-std::vector<MediaFrame> MakeFrames(const MediaSpec& spec, const std::string& directory);
+std::vector<MediaFrame> MakeFrames(const MediaRecipe& recipe, const std::string& directory);
 
 // Splits a raw stream at its access unit delimiters (H.264, H.265) or
 // pictures (MPEG-4 Part 2; headers go with the picture they precede).
@@ -51,11 +51,11 @@ std::vector<MediaFrame> SplitFrames(const std::vector<uint8_t>& stream, uint32_t
 class HostClip {
  public:
   // Frame i arrives at startMs + i * intervalMs (unsigned 32-bit).
-  HostClip(const MediaSpec& spec, const std::vector<MediaFrame>& frames, const std::string& header,
-           uint32_t startMs, uint32_t intervalMs);
+  HostClip(const MediaRecipe& recipe, const std::vector<MediaFrame>& frames,
+           const std::string& header, uint32_t startMs, uint32_t intervalMs);
   // The same with one arrival time per frame.
-  HostClip(const MediaSpec& spec, const std::vector<MediaFrame>& frames, const std::string& header,
-           const std::vector<uint32_t>& arrivalMs);
+  HostClip(const MediaRecipe& recipe, const std::vector<MediaFrame>& frames,
+           const std::string& header, const std::vector<uint32_t>& arrivalMs);
 
   const hx::CVideoEmailStream& Stream() const { return *m_stream; }
   // The whole host buffer of frame `i`, header included.
