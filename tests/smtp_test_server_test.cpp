@@ -59,18 +59,25 @@ TEST(SmtpTestServerTest, RefusedLoginIsCurlExitCode67) {
   EXPECT_EQ(server.Messages()[0].login, "user");
 }
 
-TEST(SmtpTestServerTest, StopsAndStartsOnTheSamePort) {
+TEST(SmtpTestServerTest, StopsAndStartsOnTheSamePortKeepingEarlierMessages) {
   testsupport::TempDir dir;
-  ASSERT_TRUE(testsupport::WriteFile(dir.File("mail"), "Subject: x\r\n\r\nbody"));
+  ASSERT_TRUE(testsupport::WriteFile(dir.File("before"), "Subject: before\r\n\r\nbody\r\n"));
+  ASSERT_TRUE(testsupport::WriteFile(dir.File("after"), "Subject: after\r\n\r\nbody\r\n"));
   SmtpTestServer server;
   int port = server.port();
   std::string url = "smtp://127.0.0.1:" + std::to_string(port);
+  EXPECT_EQ(Curl(url, dir.File("before"), ""), 0);
+  ASSERT_TRUE(server.WaitForMessages(1));
   server.Stop();
-  EXPECT_EQ(Curl(url, dir.File("mail"), ""), 7);  // connection refused
+  EXPECT_EQ(Curl(url, dir.File("after"), ""), 7);  // connection refused
   server.Start();
   EXPECT_EQ(server.port(), port);
-  EXPECT_EQ(Curl(url, dir.File("mail"), ""), 0);
-  EXPECT_TRUE(server.WaitForMessages(1));
+  EXPECT_EQ(Curl(url, dir.File("after"), ""), 0);
+  ASSERT_TRUE(server.WaitForMessages(2));
+  const auto mails = server.Messages();
+  ASSERT_EQ(mails.size(), 2u);
+  EXPECT_EQ(mails[0].data, "Subject: before\r\n\r\nbody\r\n");
+  EXPECT_EQ(mails[1].data, "Subject: after\r\n\r\nbody\r\n");
 }
 
 }  // namespace

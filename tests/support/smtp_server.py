@@ -26,7 +26,12 @@ class Store:
     def __init__(self, directory, maildir=None):
         self.directory = directory
         self.maildir = mailbox.Maildir(maildir, create=True) if maildir else None
+        # A server started again on the same directory numbers on after the
+        # messages already there instead of overwriting them.
         self.count = 0
+        while directory is not None and \
+                os.path.exists(os.path.join(directory, "%d.eml" % (self.count + 1))):
+            self.count += 1
 
     async def handle_DATA(self, server, session, envelope):
         self.count += 1
