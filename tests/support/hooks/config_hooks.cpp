@@ -3,6 +3,7 @@
 
 #include <tinyxml.h>
 
+#include "alertmod/config/xml_document.h"
 #include "alertmod/manager/current_manager.h"
 #include "alertmod/manager/notify_manager.h"
 #include "tests/support/hooks/hook_registry.h"
@@ -15,9 +16,9 @@ template <typename Apply>
 int32_t WithDocument(const char* text, uint32_t length, Apply apply) {
   hx::NotifyManager* manager = hx::CurrentManager();
   if (manager == nullptr || text == nullptr) return -1;
+  // Parsed as IOCTL code 2 parses a host document, depth guard included.
   TiXmlDocument document;
-  document.Parse(std::string(text, length).c_str());
-  if (document.Error()) return -1;
+  if (!hx::ParseXmlDocument(std::string(text, length), document)) return -1;
   return apply(*manager, document) ? 1 : 0;
 }
 
