@@ -43,7 +43,6 @@ constexpr char kInvalidFormatText[] = "[invalid format specified]";
 constexpr char kAllowedConversions[] = "aAbBcdHIjmMpSUwWxXyYZ%";
 constexpr size_t kFormattedDateCapacity = 80;
 
-// Event types whose source is a camera, so that a link to video makes sense.
 bool ContainsAny(const std::string& text, const char* const* first, const char* const* last) {
   for (; first != last; ++first) {
     if (text.find(*first) != std::string::npos) return true;
