@@ -4,11 +4,11 @@
 #include <string>
 
 #include "alertmod/hostsvc/process_service.h"
+#include "alertmod/mail/smtp_delivery.h"
 
 namespace hx {
 namespace {
 
-constexpr char kTransferTool[] = "./curl";
 constexpr char kSmtpsProtocol[] = "smtps";
 
 // Reads the tool's whole standard output; returns once the tool has ended.
