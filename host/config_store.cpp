@@ -30,10 +30,17 @@ void MaskPasswords(TiXmlElement& element) {
 }  // namespace
 
 void ConfigStore::Record(const hx::core::HostRequest& request) {
+  // Every request passes here (log lines, process messages, frame releases);
+  // only documents and status reports are copied.
   if (request.data == nullptr) return;
-  std::string text(static_cast<const char*>(request.data), request.length);
-  if (request.requestClass == hx::core::kClassDocument) RecordDocument(text);
-  if (request.requestClass == hx::core::kClassProfileStatus) RecordStatus(text);
+  const bool document = request.requestClass == hx::core::kClassDocument;
+  if (!document && request.requestClass != hx::core::kClassProfileStatus) return;
+  const std::string text(static_cast<const char*>(request.data), request.length);
+  if (document) {
+    RecordDocument(text);
+  } else {
+    RecordStatus(text);
+  }
 }
 
 void ConfigStore::RecordDocument(const std::string& text) {

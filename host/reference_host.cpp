@@ -182,9 +182,14 @@ int32_t ReferenceHost::Callback(hx::core::HostRequest* request, void*) {
 }
 
 int32_t ReferenceHost::Handle(hx::core::HostRequest& request) {
-  if (m_options.recordRequests) m_requests.Add(request);
+  // What the host keeps of a request (configuration, status, log line) is
+  // kept before the request log wakes its waiters, so that a waiter reading
+  // it sees this request's part too.
   m_config.Record(request);
-  if (request.requestClass == hx::core::kClassLog) return AnswerLog(request);
+  const bool log = request.requestClass == hx::core::kClassLog;
+  const int32_t logAnswer = log ? AnswerLog(request) : 0;
+  if (m_options.recordRequests) m_requests.Add(request);
+  if (log) return logAnswer;
   Handler handler;
   {
     std::lock_guard<std::mutex> lock(m_handlersMutex);

@@ -25,7 +25,6 @@
 #include <sstream>
 #include <string>
 #include <thread>
-#include <utility>
 #include <vector>
 
 #include "alertmod/host_records.h"
@@ -134,21 +133,11 @@ class FaultInjectionTest : public managertest::ManagerHostTest {
   }
   void PlainAlarm() { SendAlarm(kPlainProfile, 1); }
 
-  // Status reports as (profile, status), in order.
-  std::vector<std::pair<int, int>> Statuses() {
-    std::vector<std::pair<int, int>> statuses;
-    const std::regex report("ID=\"(-?[0-9]+)\" Status=\"(-?[0-9]+)\"");
-    for (const auto& r : host().Requests().OfClass(hx::core::kClassProfileStatus)) {
-      std::smatch match;
-      if (std::regex_search(r.bytes, match, report)) {
-        statuses.emplace_back(std::stoi(match[1]), std::stoi(match[2]));
-      }
-    }
-    return statuses;
-  }
   size_t CountStatus(int status) {
     size_t count = 0;
-    for (const auto& s : Statuses()) count += s.second == status ? 1 : 0;
+    for (const auto& report : host().Config().StatusReports()) {
+      count += report.status == status ? 1 : 0;
+    }
     return count;
   }
   bool WaitForStatus(int status, size_t count, std::chrono::milliseconds timeout = 60s) {
