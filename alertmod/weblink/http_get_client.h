@@ -56,9 +56,6 @@ class HttpGetClient {
   // override it to control the list of addresses.
   virtual Endpoints Resolve();
 
-  const std::string& host() const { return m_host; }
-  const std::string& port() const { return m_port; }
-
  private:
   using Deadline = std::chrono::steady_clock::time_point;
 
