@@ -1,10 +1,6 @@
 #include "alertmod/mail/templates.h"
 
-#include <arpa/inet.h>
 #include <gtest/gtest.h>
-#include <netinet/in.h>
-#include <sys/socket.h>
-#include <unistd.h>
 
 #include <clocale>
 #include <cstdlib>
@@ -12,6 +8,7 @@
 
 #include "alertmod/mail/event_types.h"
 #include "tests/support/fake_host.h"
+#include "tests/support/web_server.h"
 
 namespace hx {
 namespace {
@@ -201,17 +198,10 @@ TEST_F(TemplatesTest, TestNotification) {
   EXPECT_EQ(item.profile.subject, "[Test Event Type] from [Test Event Source]");
 }
 
-// A port on 127.0.0.1 on which nothing listens.
+// A port on 127.0.0.1 on which nothing listens any more.
 std::string ClosedPort() {
-  int fd = socket(AF_INET, SOCK_STREAM, 0);
-  sockaddr_in address{};
-  address.sin_family = AF_INET;
-  address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-  socklen_t length = sizeof(address);
-  bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address));
-  getsockname(fd, reinterpret_cast<sockaddr*>(&address), &length);
-  close(fd);
-  return std::to_string(ntohs(address.sin_port));
+  testsupport::WebServer gone;
+  return std::to_string(gone.port());
 }
 
 TEST_F(TemplatesTest, WebLinkChoices) {
