@@ -165,8 +165,8 @@ TEST_F(RetryQueueTest, PermanentFailureOnRetryDiscards) {
 
 // Drives passes every minute until the message leaves the queue; returns how
 // many seconds after the first failure that happened.
-uint64_t SecondsUntilDiscarded(RetryQueueTest* test, RetryQueue& queue, ScriptedHelper& helper,
-                               FakeStream& stream, uint32_t& tick, int32_t maxRetrySeconds) {
+uint64_t SecondsUntilDiscarded(RetryQueue& queue, ScriptedHelper& helper, FakeStream& stream,
+                               uint32_t& tick, int32_t maxRetrySeconds) {
   uint64_t elapsed = 0;
   while (!queue.Empty() && elapsed < 400ull * 86400) {
     helper.exitCodes = {7};
@@ -174,7 +174,6 @@ uint64_t SecondsUntilDiscarded(RetryQueueTest* test, RetryQueue& queue, Scripted
     elapsed += 60;
     queue.RetryPass(helper, stream, maxRetrySeconds);
   }
-  (void)test;
   return elapsed;
 }
 
@@ -194,8 +193,7 @@ TEST_F(RetryQueueTest, RetryWindowEndsTheRetries) {
     RetryQueue queue;
     queue.Enqueue(m_helper, Message("w" + std::to_string(c.maxRetrySeconds)), {SmtpServer{}}, 100,
                   m_stream);
-    uint64_t seconds =
-        SecondsUntilDiscarded(this, queue, m_helper, m_stream, m_tick, c.maxRetrySeconds);
+    uint64_t seconds = SecondsUntilDiscarded(queue, m_helper, m_stream, m_tick, c.maxRetrySeconds);
     EXPECT_GE(seconds, c.atLeast) << c.maxRetrySeconds;
     EXPECT_LE(seconds, c.atMost) << c.maxRetrySeconds;
   }
