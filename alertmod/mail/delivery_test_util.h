@@ -4,6 +4,7 @@
 #ifndef ALERTMOD_MAIL_DELIVERY_TEST_UTIL_H_
 #define ALERTMOD_MAIL_DELIVERY_TEST_UTIL_H_
 
+#include <algorithm>
 #include <deque>
 #include <string>
 #include <utility>
@@ -13,6 +14,7 @@
 #include "alertmod/mail/notify_helper.h"
 #include "alertmod/platform/file_system.h"
 #include "tests/support/fake_host.h"
+#include "tests/support/temp_dir.h"
 
 namespace hx {
 
@@ -30,6 +32,10 @@ class ScriptedHelper final : public NotifyHelper {
                   int32_t& exitCode, std::vector<std::string>& errorLines) override {
     runs.push_back(arguments);
     inputs.push_back(input);
+    // The job removes a message file once it is sent; keep what was sent.
+    auto file = std::find(arguments.begin(), arguments.end(), "-T");
+    bool named = file != arguments.end() && file + 1 != arguments.end();
+    messages.push_back(named ? testsupport::ReadFile(*(file + 1)) : std::string());
     int32_t next = exitCodes.empty() ? 0 : exitCodes.front();
     if (!exitCodes.empty()) exitCodes.pop_front();
     if (next == kNotStarted) return false;
@@ -42,6 +48,7 @@ class ScriptedHelper final : public NotifyHelper {
   std::vector<std::string> output;
   std::vector<std::vector<std::string>> runs;
   std::vector<std::string> inputs;
+  std::vector<std::string> messages;  // the message file's content at each run
   std::vector<std::pair<int32_t, int32_t>> statuses;
 };
 

@@ -2,7 +2,7 @@
 
 #include <gtest/gtest.h>
 
-#include <map>
+#include <algorithm>
 
 #include "alertmod/diag/log.h"
 #include "alertmod/mail/delivery_test_util.h"
@@ -82,8 +82,8 @@ class NotificationJobTest : public ::testing::Test {
     platform::ListRegularFiles(DataDirectory(), &names, &exists);
     return names;
   }
-  // The message files handed to the transfer tool, read when it "ran".
-  std::string SentMessage(size_t run) {
+  // The message file handed to the transfer tool in run `run`.
+  std::string SentPath(size_t run) {
     const auto& args = m_helper.runs.at(run);
     return args[args.size() - 2];
   }
@@ -144,9 +144,14 @@ TEST_F(NotificationJobTest, UnpreparedAttachmentLeavesALineInTheBody) {
   AddSource("Empty", std::make_shared<CVideoEmailStream>(StreamFormat{}, 1000, 0, 1000, nullptr));
   m_writer.fail = true;
   AddSource("Broken", Clip(5, {0, 40}, 100, 0));
-  std::string composed;
   Run();
   ASSERT_EQ(m_helper.runs.size(), 1u);
+  EXPECT_NE(m_helper.messages[0].find(
+                "Look\n- Failed to prepare video attachment for source: \"Empty\", "
+                "\n- Failed to prepare video attachment for source: \"Broken\", \r\n--"),
+            std::string::npos)
+      << m_helper.messages[0];
+  EXPECT_EQ(m_helper.messages[0].find("Content-Disposition"), std::string::npos);
   EXPECT_TRUE(m_host.Log().Contains("Failed to prepare video attachment for source: \"Empty\", "));
   EXPECT_TRUE(m_host.Log().Contains("Failed to prepare video attachment for source: \"Broken\", "));
   EXPECT_EQ(m_writer.paths.size(), 1u) << "a clip without frames is not even written";
@@ -175,8 +180,16 @@ TEST_F(NotificationJobTest, LargeAttachmentsAreSplitIntoParts) {
   AddSource("c", Clip(5, {0}, 3 * kMiB, 0));
   Run();
   ASSERT_EQ(m_helper.runs.size(), 2u);
-  EXPECT_NE(SentMessage(0).find("-Part-1-of-2"), std::string::npos);
-  EXPECT_NE(SentMessage(1).find("-Part-2-of-2"), std::string::npos);
+  EXPECT_NE(SentPath(0).find("-Part-1-of-2"), std::string::npos);
+  EXPECT_NE(SentPath(1).find("-Part-2-of-2"), std::string::npos);
+  const char* const attached[] = {"filename=\"a.mov\"", "filename=\"b.mov\"", "filename=\"c.mov\""};
+  const size_t inPart[] = {0, 1, 1};
+  for (size_t i = 0; i < 3; ++i) {
+    for (size_t part = 0; part < 2; ++part) {
+      EXPECT_EQ(m_helper.messages[part].find(attached[i]) != std::string::npos, inPart[i] == part)
+          << attached[i] << " in part " << part + 1;
+    }
+  }
   EXPECT_EQ(m_helper.statuses.back(), std::make_pair(3, 0));
 }
 
@@ -204,11 +217,17 @@ TEST_F(NotificationJobTest, NoDataDirectoryReportsFailure) {
 
 TEST_F(NotificationJobTest, SequenceRestartsWhenTheQueueIsEmpty) {
   m_item.profile.attach = false;
-  m_helper.exitCodes = {7, 0};
+  m_helper.exitCodes = {7, 0, 0};
   Run();  // queued: sequence 1
   Run();  // sent while one waits: the sequence stays
   EXPECT_EQ(m_helper.Retries().Sequence(), 1u);
-  EXPECT_NE(SentMessage(1).find("-1"), std::string::npos);
+  m_helper.Retries().Clear(m_helper, m_stream);
+  Run();  // sent with nothing waiting: the sequence starts again
+  EXPECT_EQ(m_helper.Retries().Sequence(), 0u);
+  const std::string name = "./data/notify-mail-3-1767225600-0-";
+  EXPECT_EQ(SentPath(0), name + "0");
+  EXPECT_EQ(SentPath(1), name + "1");
+  EXPECT_EQ(SentPath(2), name + "1");
 }
 
 }  // namespace
