@@ -1,6 +1,9 @@
 #include "alertmod/config/durable_xml.h"
 
 #include <atomic>
+#include <condition_variable>
+#include <mutex>
+#include <set>
 
 #include "alertmod/config/xml_document.h"
 #include "alertmod/platform/error_text.h"
@@ -8,6 +11,54 @@
 
 namespace hx {
 namespace {
+
+// The process-wide set of file names being loaded or saved, so that two
+// threads never touch the same file at once. Names are exact byte strings;
+// two spellings of one path are two names.
+class FileNameGuard final {
+ public:
+  static FileNameGuard& Instance() {
+    static FileNameGuard guard;
+    return guard;
+  }
+
+  // Waits until no other holder has `name`, then holds it.
+  void Acquire(const std::string& name) {
+    std::unique_lock<std::mutex> lock(m_mutex);
+    m_released.wait(lock, [&] { return m_names.count(name) == 0; });
+    m_names.insert(name);
+  }
+
+  // Gives `name` up and wakes its waiters. Requires that the caller holds it.
+  void Release(const std::string& name) {
+    {
+      std::lock_guard<std::mutex> lock(m_mutex);
+      m_names.erase(name);
+    }
+    m_released.notify_all();
+  }
+
+ private:
+  FileNameGuard() = default;
+
+  std::mutex m_mutex;
+  std::condition_variable m_released;
+  std::set<std::string> m_names;
+};
+
+// Holds one name of the FileNameGuard for its scope.
+class FileNameLock final {
+ public:
+  explicit FileNameLock(std::string name) : m_name(std::move(name)) {
+    FileNameGuard::Instance().Acquire(m_name);
+  }
+  ~FileNameLock() { FileNameGuard::Instance().Release(m_name); }
+  FileNameLock(const FileNameLock&) = delete;
+  FileNameLock& operator=(const FileNameLock&) = delete;
+
+ private:
+  std::string m_name;
+};
 
 std::atomic<SideFileSyncedHook> g_sideFileSyncedHook{nullptr};
 
@@ -80,25 +131,6 @@ std::string PrintXmlIndented(const TiXmlDocument& document) {
   printer.SetLineBreak("\n");
   document.Accept(&printer);
   return printer.Str();
-}
-
-FileNameGuard& FileNameGuard::Instance() {
-  static FileNameGuard guard;
-  return guard;
-}
-
-void FileNameGuard::Acquire(const std::string& name) {
-  std::unique_lock<std::mutex> lock(m_mutex);
-  m_released.wait(lock, [&] { return m_names.count(name) == 0; });
-  m_names.insert(name);
-}
-
-void FileNameGuard::Release(const std::string& name) {
-  {
-    std::lock_guard<std::mutex> lock(m_mutex);
-    m_names.erase(name);
-  }
-  m_released.notify_all();
 }
 
 void SetSideFileSyncedHook(SideFileSyncedHook hook) {

@@ -8,9 +8,6 @@
 #ifndef ALERTMOD_CONFIG_DURABLE_XML_H_
 #define ALERTMOD_CONFIG_DURABLE_XML_H_
 
-#include <condition_variable>
-#include <mutex>
-#include <set>
 #include <string>
 
 #include <tinyxml.h>
@@ -36,41 +33,8 @@ bool SaveXmlDurably(const TiXmlDocument& document, const std::string& fileName,
 
 // Reads and parses `fileName`, adopting a complete side file first (one that
 // parses and has a root element; it then replaces the target). False when no
-// document could be read and parsed; `document` then holds the parser's error.
+// document could be read and parsed.
 bool LoadXmlDurably(TiXmlDocument& document, const std::string& fileName);
-
-// The process-wide set of file names being loaded or saved. Names are exact
-// byte strings; two spellings of one path are two names.
-class FileNameGuard {
- public:
-  static FileNameGuard& Instance();
-
-  // Waits until no other holder has `name`, then holds it.
-  void Acquire(const std::string& name);
-  // Gives `name` up and wakes its waiters. Requires that the caller holds it.
-  void Release(const std::string& name);
-
- private:
-  FileNameGuard() = default;
-
-  std::mutex m_mutex;
-  std::condition_variable m_released;
-  std::set<std::string> m_names;
-};
-
-// Holds one name of the FileNameGuard for its scope.
-class FileNameLock {
- public:
-  explicit FileNameLock(std::string name) : m_name(std::move(name)) {
-    FileNameGuard::Instance().Acquire(m_name);
-  }
-  ~FileNameLock() { FileNameGuard::Instance().Release(m_name); }
-  FileNameLock(const FileNameLock&) = delete;
-  FileNameLock& operator=(const FileNameLock&) = delete;
-
- private:
-  std::string m_name;
-};
 
 // Test seam: called by a save after the side file reached the storage device
 // and before it is closed and renamed, with the side file's name, while the
