@@ -1,13 +1,11 @@
 #include "alertmod/mail/notification_job.h"
 
-#include <sys/stat.h>
-
-#include <cinttypes>
 #include <cstdio>
 #include <vector>
 
 #include "alertmod/diag/log.h"
 #include "alertmod/mail/mail_file.h"
+#include "alertmod/mail/notify_file.h"
 #include "alertmod/mail/smtp_delivery.h"
 #include "alertmod/mail/templates.h"
 #include "alertmod/video/video_email_stream.h"
@@ -37,10 +35,12 @@ bool HasFirstPayload(const CVideoEmailStream& stream) {
 }
 
 // The writers of the clip writer report success even when the codec
-// libraries were missing and nothing was written, so the file decides.
+// libraries were missing and nothing was written, so the file decides: it
+// must give at least one byte to the reader that composition uses.
 bool FileWritten(const std::string& path) {
-  struct stat info {};
-  return stat(path.c_str(), &info) == 0 && S_ISREG(info.st_mode) && info.st_size > 0;
+  CNotifyFileImpl file(path);
+  char first = 0;
+  return file.Read(&first, 1) == 1;
 }
 
 std::string AttachmentLine(const std::string& path, const CVideoEmailStream& stream) {

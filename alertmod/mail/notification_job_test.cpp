@@ -25,14 +25,19 @@ class RecordingWriter final : public IAttachmentWriter {
   bool WriteJpeg(const CVideoEmailStream& stream, const std::string& path) override {
     return Write(stream, path);
   }
+  // How a write ends: the clip's bytes, a failure, success claimed without
+  // a file (as without the codec libraries), or an empty file.
+  enum class Mode { kWrite, kFail, kNoFile, kEmptyFile };
   std::vector<std::string> paths;
-  bool fail = false;
+  Mode mode = Mode::kWrite;
 
  private:
   bool Write(const CVideoEmailStream& stream, const std::string& path) {
     paths.push_back(path);
-    if (fail) return false;
-    return testsupport::WriteFile(path, std::string(stream.ByteCount(), 'v'));
+    if (mode == Mode::kFail) return false;
+    if (mode == Mode::kNoFile) return true;
+    size_t bytes = mode == Mode::kEmptyFile ? 0 : stream.ByteCount();
+    return testsupport::WriteFile(path, std::string(bytes, 'v'));
   }
 };
 
@@ -142,7 +147,7 @@ TEST_F(NotificationJobTest, SameNameSharesOneFile) {
 
 TEST_F(NotificationJobTest, UnpreparedAttachmentLeavesALineInTheBody) {
   AddSource("Empty", std::make_shared<CVideoEmailStream>(StreamFormat{}, 1000, 0, 1000, nullptr));
-  m_writer.fail = true;
+  m_writer.mode = RecordingWriter::Mode::kFail;
   AddSource("Broken", Clip(5, {0, 40}, 100, 0));
   Run();
   ASSERT_EQ(m_helper.runs.size(), 1u);
@@ -155,6 +160,23 @@ TEST_F(NotificationJobTest, UnpreparedAttachmentLeavesALineInTheBody) {
   EXPECT_TRUE(m_host.Log().Contains("Failed to prepare video attachment for source: \"Empty\", "));
   EXPECT_TRUE(m_host.Log().Contains("Failed to prepare video attachment for source: \"Broken\", "));
   EXPECT_EQ(m_writer.paths.size(), 1u) << "a clip without frames is not even written";
+}
+
+TEST_F(NotificationJobTest, AWriterThatLeavesNoBytesAttachesNothing) {
+  for (RecordingWriter::Mode mode :
+       {RecordingWriter::Mode::kNoFile, RecordingWriter::Mode::kEmptyFile}) {
+    m_helper.messages.clear();
+    m_writer.mode = mode;
+    m_item.videoSources.clear();
+    AddSource("Lobby", Clip(5, {0, 40}, 100, 0));
+    Run();
+    ASSERT_EQ(m_helper.messages.size(), 1u);
+    EXPECT_NE(m_helper.messages[0].find("- Failed to prepare video attachment for source: "
+                                        "\"Lobby\", "),
+              std::string::npos)
+        << m_helper.messages[0];
+    EXPECT_EQ(m_helper.messages[0].find("Content-Disposition"), std::string::npos);
+  }
 }
 
 TEST_F(NotificationJobTest, AttachmentLineDescribesTheClip) {
