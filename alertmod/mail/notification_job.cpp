@@ -1,6 +1,7 @@
 #include "alertmod/mail/notification_job.h"
 
 #include <cstdio>
+#include <cstring>
 #include <vector>
 
 #include "alertmod/diag/log.h"
@@ -41,6 +42,18 @@ bool FileWritten(const std::string& path) {
   CNotifyFileImpl file(path);
   char first = 0;
   return file.Read(&first, 1) == 1;
+}
+
+// The file name an attachment of source `name` gets: "default" for an empty
+// name, and every control character and every character that a path cannot
+// safely hold replaced by "_".
+std::string AttachmentFileName(const std::string& name) {
+  if (name.empty()) return "default";
+  std::string file = name;
+  for (char& c : file) {
+    if (static_cast<unsigned char>(c) < 32 || strchr("/?<>\\:*|\"", c) != nullptr) c = '_';
+  }
+  return file;
 }
 
 std::string AttachmentLine(const std::string& path, const CVideoEmailStream& stream) {
@@ -125,16 +138,6 @@ bool SendMessage(NotifyWorkItem& item, const std::vector<MailAttachment>& attach
 }
 
 }  // namespace
-
-std::string AttachmentFileName(const std::string& name) {
-  if (name.empty()) return "default";
-  std::string file = name;
-  for (char& c : file) {
-    unsigned char u = static_cast<unsigned char>(c);
-    if (u < 32 || std::string("/?<>\\:*|\"").find(c) != std::string::npos) c = '_';
-  }
-  return file;
-}
 
 void RunNotificationJob(NotifyWorkItem& item, NotifyHelper& helper, INotifyFileStream& stream,
                         int32_t maxRetryQueue, IAttachmentWriter& writer) {

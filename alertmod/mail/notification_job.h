@@ -44,11 +44,6 @@ std::unique_ptr<IAttachmentWriter> MakeAttachmentWriter(core::HostCallbackFn cal
 void RunNotificationJob(NotifyWorkItem& item, NotifyHelper& helper, INotifyFileStream& stream,
                         int32_t maxRetryQueue, IAttachmentWriter& writer);
 
-// The file name an attachment of source `name` gets: "default" for an empty
-// name, and every control character and every character that a path cannot
-// safely hold replaced by "_".
-std::string AttachmentFileName(const std::string& name);
-
 }  // namespace hx
 
 #endif  // ALERTMOD_MAIL_NOTIFICATION_JOB_H_
