@@ -200,6 +200,37 @@ TEST_F(SystemDocumentsTest, SizeLimitDecidesWhetherVideoIsBuffered) {
   }
 }
 
+TEST_F(SystemDocumentsTest, TurningVideoOffReturnsTheFramesHeldAndAttachesNoOldVideo) {
+  ProfileSetting profile{1, "Front door"};
+  profile.attach = true;
+  profile.maxVideoSeconds = 60;  // the clip goes on collecting
+  profile.eventEdge = 2;
+  StartWith(NotifyFile({profile}, 10));
+  SendSystem(OneCamera(1, "Lobby"));
+  PushFrames(Id(1), 10, 10, 40);
+  SendAlarm(1, 1);
+  ASSERT_EQ(State().pending, 1u);
+
+  host().SendConfigurationUpdate(NotifyElement({profile}, 0));
+  ASSERT_TRUE(WaitForLog("Updated configuration successfully"));
+  // No frame can come any more: the waiting notification goes with what it
+  // has, and the host has every other buffer back.
+  const testhooks::ManagerStateRecord state = State();
+  EXPECT_TRUE(state.bufferedStreams.empty());
+  EXPECT_EQ(state.pending + state.ready, 0u);
+  ASSERT_TRUE(WaitForItems(1));
+  EXPECT_TRUE(Items()[0].videoSources.at(0).done);
+  EXPECT_EQ(Items()[0].videoSources.at(0).frames, 10u);
+  EXPECT_FALSE(PushFrame(Id(1), true));
+
+  // A later alarm finds no video from before the change to attach.
+  SendAlarm(1, 1);
+  ASSERT_TRUE(WaitForItems(2));
+  EXPECT_FALSE(Items()[1].videoSources.at(0).hasStream);
+  EXPECT_EQ(State().pending, 0u);
+  ExpectFramesReturned();
+}
+
 TEST_F(SystemDocumentsTest, AFrameLargerThanANewLimitIsRefused) {
   StartWith(NotifyFile({ProfileSetting{1, "Front door"}}, 10));
   SendSystem(OneCamera(1, "Lobby"));

@@ -185,6 +185,13 @@ void NotifyManager::PublishConfigSettings() {
 
 void NotifyManager::SetVideoBufferLimit(int64_t bytes) {
   m_videoBuffer.SetMaxBytes(bytes > 0 ? static_cast<uint64_t>(bytes) : 0);
+  if (bytes > 0) return;
+  // Video is off: the frame intake keeps no frame any more, so the frames
+  // held would only reach later notifications as old video, and the host
+  // would not get its buffers back. Captures end with what they hold.
+  std::vector<int32_t> streamIds;
+  m_videoBuffer.StreamIds(&streamIds);
+  for (int32_t streamId : streamIds) m_videoBuffer.RemoveStream(streamId);
 }
 
 }  // namespace hx

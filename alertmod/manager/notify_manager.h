@@ -128,7 +128,8 @@ class NotifyManager {
   // and only the three limits it read before the rejection (an element
   // without "Servers" or "Profiles") take effect. Otherwise the new
   // configuration is saved and posted, and the profiles whose last delivery
-  // result no longer applies are reported with status -1.
+  // result no longer applies are reported with status -1. A size limit of 0
+  // turns video off: every buffered stream is dropped, its captures ended.
   bool ApplyConfigurationUpdate(const TiXmlDocument& document);
   // Applies the host's second reviewer setting (Trellan / Users /
   // SecondReviewer "Enabled"). Returns whether the mode changed; a change
