@@ -33,7 +33,7 @@ constexpr size_t kLineChars = Base64EncodedLength(kLineBytes);
 constexpr size_t kLinesPerBlock = 4096;
 
 // A CR or LF inside a header value would start a header of the sender's
-// choosing; it becomes a space.
+// choosing; it becomes a space. (Extracted addresses cannot hold either.)
 std::string HeaderValue(std::string value) {
   for (char& c : value) {
     if (c == '\r' || c == '\n') c = ' ';
@@ -70,7 +70,7 @@ bool AddRecipients(const char* label, const std::vector<std::string>& texts,
     if (!ExtractAddress(address)) return false;
     mail.recipients.push_back(address);
     if (label == nullptr) continue;
-    stream.WriteString(HeaderValue(address));
+    stream.WriteString(address);
     stream.WriteText(i + 1 < texts.size() ? "," : kCrLf);
   }
   return true;
@@ -81,7 +81,7 @@ bool WriteHeader(const NotifyWorkItem& item, uint32_t part, uint32_t total,
   std::string sender = item.profile.from;
   if (!ExtractAddress(sender)) return false;
   mail.sender = sender;
-  stream.WriteText("From: ").WriteString(HeaderValue(sender)).WriteText(kCrLf);
+  stream.WriteText("From: ").WriteString(sender).WriteText(kCrLf);
   if (!AddRecipients("To: ", item.profile.to, stream, mail)) return false;
   stream.WriteString(DateLine());
   if (!AddRecipients("Cc: ", item.profile.cc, stream, mail)) return false;
