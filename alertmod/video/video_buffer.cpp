@@ -68,19 +68,21 @@ bool VideoBuffer::AddFrame(int32_t streamId, uint32_t frameType, uint32_t payloa
     ReportMalformed(streamId, payloadOffset, size);
     return false;
   }
-  std::shared_ptr<FrameData> holder;
+  // The frame's own handle is the only local one: a second copy would cost
+  // an extra pair of atomic count changes on every frame of every camera.
+  VideoFrame frame{0, frameType, payloadOffset, nullptr};
   try {
-    holder = MakeFrameData(m_host, data, size);
-    const VideoFrame frame{platform::TickMs(), frameType, payloadOffset, holder};
+    frame.data = MakeFrameData(m_host, data, size);
+    frame.arrivalMs = platform::TickMs();
     if (StreamFor(streamId).AddFrame(frame, format)) return true;
   } catch (...) {
     // Out of memory part way: whoever took the frame before still holds it,
     // and the host must then leave the buffer to the module.
-    if (holder && holder.use_count() > 1) return true;
+    if (frame.data && frame.data.use_count() > 1) return true;
   }
   // Still the host's: forget the pointer so that dropping the handle sends
   // no release.
-  if (holder) holder->Clear();
+  if (frame.data) frame.data->Clear();
   return false;
 }
 
