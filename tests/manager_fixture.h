@@ -49,8 +49,8 @@ class ManagerHostTest : public testsupport::ModuleHostTest {
   void SendSystem(const refhost::SystemDescription& system);
   // Sends an alarm document through Write.
   void SendAlarm(const refhost::AlarmDocument& alarm);
-  // One request on camera `camera` (plug-in 0x10000, device 1, input 0 by
-  // default) for profile `profile`.
+  // One request for profile `profile` on the camera of plug-in 0x10000,
+  // device 1, input 0.
   void SendAlarm(int32_t profile, int32_t alarm, int32_t action = 0);
   // The host's answer to a watchdog tick.
   void Tick();
@@ -76,7 +76,7 @@ class ManagerHostTest : public testsupport::ModuleHostTest {
   // The items the worker received so far.
   std::vector<testhooks::WorkItemRecord> Items();
   // Waits for the dispatcher and the worker to have handled everything sent
-  // so far, then checks that no more than `count` items arrived.
+  // so far, then returns how many items have arrived.
   size_t ItemCountAfterQuiet();
 
   // Stops the host and checks that every frame buffer came back once.
