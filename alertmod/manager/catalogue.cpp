@@ -225,19 +225,18 @@ void HostSystemCatalogue::AddEncoderStreams(const TiXmlElement& encoder, int32_t
     m_streams[*id] = identity;
     m_identities[EncoderSlot{kind, plugin, device, encoderNumber, *number, context}] = identity;
     if (video) {
-      AddChannel(channel, *id, identity);
+      AddChannel(channel, *id, *number, identity);
     }
   });
 }
 
-void HostSystemCatalogue::AddChannel(const TiXmlElement& channel, int32_t streamId,
+void HostSystemCatalogue::AddChannel(const TiXmlElement& channel, int32_t streamId, int32_t number,
                                      const SourceIdentity& identity) {
-  const std::optional<int32_t> number = IntAttribute(channel, "Number");
   const std::optional<int32_t> width = IntAttribute(channel, "Width");
   const std::optional<int32_t> height = IntAttribute(channel, "Height");
   const std::optional<int32_t> standard = IntAttribute(channel, "Standard");
-  if (number && width && height && standard) {
-    m_formats[streamId] = StreamFormatRecord{streamId, *number, *width, *height, *standard};
+  if (width && height && standard) {
+    m_formats[streamId] = StreamFormatRecord{streamId, number, *width, *height, *standard};
   } else {
     m_formats.erase(streamId);
   }

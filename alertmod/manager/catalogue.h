@@ -151,7 +151,8 @@ class HostSystemCatalogue {
   void DiscardPlugin(int32_t plugin);
   void AddEncoderStreams(const TiXmlElement& encoder, int32_t plugin, int32_t device,
                          int32_t context);
-  void AddChannel(const TiXmlElement& channel, int32_t streamId, const SourceIdentity& identity);
+  void AddChannel(const TiXmlElement& channel, int32_t streamId, int32_t number,
+                  const SourceIdentity& identity);
   void AddDeviceInputNames(const TiXmlElement& device, int32_t plugin, int32_t deviceNumber);
   void DropUnnamedCameraStreams();
   void RebuildPosAtm(const TiXmlElement& trellan);
