@@ -8,13 +8,6 @@
 namespace hx {
 namespace {
 
-// Majors of FFmpeg 7, 6 and 5, newest first.
-const std::vector<int> kAvCodecMajors = {61, 60, 59};
-const std::vector<int> kAvFormatMajors = {61, 60, 59};
-const std::vector<int> kAvUtilMajors = {59, 58, 57};
-const std::vector<int> kAvFilterMajors = {10, 9, 8};
-const std::vector<int> kSwResampleMajors = {5, 4};
-
 std::string LibraryPath(const std::string& directory, const char* baseName, int major) {
   std::string path = directory;
   if (!path.empty() && path.back() != '/') path.push_back('/');
@@ -36,20 +29,17 @@ void LibWrapper::Unload() {
   Resolve();
 }
 
-bool LibWrapper::LoadFile(const char* baseName, const std::vector<int>& majors, int builtMajor,
-                          const char* versionSymbol) {
-  for (int major : majors) {
-    const std::string path = LibraryPath(m_directory, baseName, major);
-    void* module = platform::OpenSharedLibrary(path);
-    if (module == nullptr) continue;
-    ReplaceModule(module, path);
-    Resolve();
-    if (!IsResolved()) continue;
-    if (IsBuiltMajor(versionSymbol, builtMajor)) return true;
-    // Its structures are laid out differently from what the module reads.
-    ReplaceModule(nullptr, std::string());
-    Resolve();
-  }
+bool LibWrapper::LoadFile(const char* baseName, int builtMajor, const char* versionSymbol) {
+  const std::string path = LibraryPath(m_directory, baseName, builtMajor);
+  void* module = platform::OpenSharedLibrary(path);
+  if (module == nullptr) return false;
+  ReplaceModule(module, path);
+  Resolve();
+  if (!IsResolved()) return false;
+  if (IsBuiltMajor(versionSymbol, builtMajor)) return true;
+  // Its structures are laid out differently from what the module reads.
+  ReplaceModule(nullptr, std::string());
+  Resolve();
   return false;
 }
 
@@ -73,7 +63,7 @@ bool LibWrapper::IsBuiltMajor(const char* versionSymbol, int builtMajor) const {
 }
 
 bool AVCodecLib::Load() {
-  return LoadFile("avcodec", kAvCodecMajors, LIBAVCODEC_VERSION_MAJOR, "avcodec_version");
+  return LoadFile("avcodec", LIBAVCODEC_VERSION_MAJOR, "avcodec_version");
 }
 
 void AVCodecLib::Resolve() {
@@ -102,7 +92,7 @@ void AVCodecLib::Resolve() {
 }
 
 bool AVFormatLib::Load() {
-  return LoadFile("avformat", kAvFormatMajors, LIBAVFORMAT_VERSION_MAJOR, "avformat_version");
+  return LoadFile("avformat", LIBAVFORMAT_VERSION_MAJOR, "avformat_version");
 }
 
 void AVFormatLib::Resolve() {
@@ -128,7 +118,7 @@ void AVFormatLib::Resolve() {
 }
 
 bool AVUtilLib::Load() {
-  return LoadFile("avutil", kAvUtilMajors, LIBAVUTIL_VERSION_MAJOR, "avutil_version");
+  return LoadFile("avutil", LIBAVUTIL_VERSION_MAJOR, "avutil_version");
 }
 
 void AVUtilLib::Resolve() {
@@ -148,7 +138,7 @@ void AVUtilLib::Resolve() {
 }
 
 bool AVFilterLib::Load() {
-  return LoadFile("avfilter", kAvFilterMajors, LIBAVFILTER_VERSION_MAJOR, "avfilter_version");
+  return LoadFile("avfilter", LIBAVFILTER_VERSION_MAJOR, "avfilter_version");
 }
 
 void AVFilterLib::Resolve() {
@@ -168,8 +158,7 @@ void AVFilterLib::Resolve() {
 }
 
 bool SWResampleLib::Load() {
-  return LoadFile("swresample", kSwResampleMajors, LIBSWRESAMPLE_VERSION_MAJOR,
-                  "swresample_version");
+  return LoadFile("swresample", LIBSWRESAMPLE_VERSION_MAJOR, "swresample_version");
 }
 
 void SWResampleLib::Resolve() {

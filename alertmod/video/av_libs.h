@@ -11,10 +11,10 @@
 // only on the notification worker, which writes one clip at a time, and
 // every user checks AllLoaded() before calling through a pointer.
 //
-// Library files are tried newest release first ("lib<base>.so.<major>" for
-// FFmpeg 7, 6 and 5). A library whose major version differs from the one the
-// module was compiled for is not used: the module reads the libraries'
-// structures with the layout of its own headers.
+// Each library is the file "lib<base>.so.<major>" of the major version the
+// module was compiled for, and must report that version: the module reads
+// the libraries' structures with the layout of its own headers, so no other
+// release will do.
 #ifndef ALERTMOD_VIDEO_AV_LIBS_H_
 #define ALERTMOD_VIDEO_AV_LIBS_H_
 
@@ -70,13 +70,11 @@ class LibWrapper {
   void SetDirectory(const std::string& directory) { m_directory = directory; }
 
  protected:
-  // Tries "lib<baseName>.so.<major>" for each of `majors` in order. A file
-  // that loads replaces the one loaded before. Returns true at the first
-  // file that has every required symbol and whose `versionSymbol` reports
-  // `builtMajor`; a file of another major is freed again. A file lacking a
-  // symbol stays loaded (unless a later one loads) and the result is false.
-  bool LoadFile(const char* baseName, const std::vector<int>& majors, int builtMajor,
-                const char* versionSymbol);
+  // Loads "lib<baseName>.so.<builtMajor>"; once loaded it replaces the file
+  // loaded before. Returns true when it has every required symbol and its
+  // `versionSymbol` reports `builtMajor`; a file of another major is freed
+  // again. A file lacking a symbol stays loaded and the result is false.
+  bool LoadFile(const char* baseName, int builtMajor, const char* versionSymbol);
 
   // Stores the address of `name` in `slot` (null when absent or nothing is
   // loaded) and returns whether it was found.

@@ -112,6 +112,20 @@ TEST(CodecLibrariesTest, OldRegistrationFunctionsAreCalledOncePerCompletedLoad) 
   EXPECT_EQ(StubRegisterCalls(0), 1);
 }
 
+// Mended: files of other releases were opened first and, once opened, stayed
+// mapped for the life of the process; one that reported the expected version
+// under another release's name was even used.
+TEST(CodecLibrariesTest, OnlyTheFileOfTheBuiltMajorIsOpened) {
+  LibraryDirectory dir;
+  dir.LinkAll();
+  const std::string built = "libavcodec.so." + std::to_string(LIBAVCODEC_VERSION_MAJOR);
+  dir.Set("libavcodec.so." + std::to_string(LIBAVCODEC_VERSION_MAJOR + 1), STUB_AV_COMPLETE);
+  av_init libs(dir.path());
+  ASSERT_TRUE(libs.AllLoaded());
+  EXPECT_EQ(static_cast<AVCodecLib&>(libs).LoadedFile(), dir.path() + "/" + built);
+  EXPECT_EQ(FileOf(reinterpret_cast<void*>(libs.avcodec_version)), dir.RealTarget(built));
+}
+
 TEST(CodecLibrariesTest, IncompleteSetsCountAsNotLoaded) {
   struct Case {
     const char* name;
