@@ -88,7 +88,6 @@ int PSConvertAVCodecStream::Open(const PSFileHeader& header, const IPSConvertStr
     Release(false);
     return kConvertOpenFailed;
   }
-  m_header = header;
   m_fileName = fileName;
   m_context->flags |= AVFMT_FLAG_BITEXACT;
   // The shared output format is read-only in current releases, so its
@@ -109,7 +108,6 @@ int PSConvertAVCodecStream::Open(const PSFileHeader& header, const IPSConvertStr
   m_heldBack.clear();
   m_headerWritten = false;
   m_headerFailed = false;
-  m_haveStartTime = false;
   if (!CreateStreams(info)) {
     Release(true);
     return kConvertOpenFailed;
@@ -282,11 +280,6 @@ int PSConvertAVCodecStream::WriteHeldBack() {
 }
 
 int PSConvertAVCodecStream::WriteToContainer(StreamSlot* slot, const _PSFILE_PACKET& packet) {
-  const int64_t timeMs = PacketTime(packet);
-  if (!m_haveStartTime) {
-    m_startTimeMs = timeMs;
-    m_haveStartTime = true;
-  }
   const int filled = FillPayload(*slot, packet);
   if (filled <= 0) return filled;  // nothing to write, or out of memory
   // Time counts frames at the stream's constant rate, whatever the

@@ -148,13 +148,10 @@ class PSConvertAVCodecStream final : public IPSConvertStream {
   AVDictionary* m_formatOptions = nullptr;
   AVPacket* m_avPacket = nullptr;
   std::vector<PSConvertOption> m_options;
-  PSFileHeader m_header;
   std::string m_fileName;
   bool m_isAvi = false;
   bool m_headerWritten = false;
   bool m_headerFailed = false;  // the container refused its header; never retried
-  bool m_haveStartTime = false;
-  int64_t m_startTimeMs = 0;
   std::array<StreamSlot, kMaxConvertStreams> m_slots;
   std::vector<HeldPacket> m_heldBack;
   std::vector<NalUnit> m_units;  // reused between packets
