@@ -16,9 +16,9 @@ using hx::core::kModuleId;
 
 namespace {
 
-// The process-wide state of the loaded library.
+// The process-wide state of the loaded library, beside the one manager
+// (hx::CurrentManager).
 std::atomic<HostCallbackFn> g_hostCallback{nullptr};
-std::atomic<hx::NotifyManager*> g_manager{nullptr};
 
 bool SendProcessMessageToHost(const void* data, uint64_t length) {
   HostCallbackFn callback = g_hostCallback.load();
@@ -75,9 +75,8 @@ int32_t Load(hx::core::LoadParmsIn* in, hx::core::LoadParmsOut* out) {
     if (in == nullptr) return;
     HostCallbackFn callback = in->callback;
     g_hostCallback.store(callback);
-    if (g_manager.load() == nullptr) {
-      g_manager.store(new hx::NotifyManager(callback, hx::DefaultWorkerJobFactory(callback)));
-      hx::SetCurrentManager(g_manager.load());
+    if (hx::CurrentManager() == nullptr) {
+      hx::SetCurrentManager(new hx::NotifyManager(callback, hx::DefaultWorkerJobFactory(callback)));
     }
     if (out != nullptr) FillLoadParmsOut(out);
     hx::ipc::RegisterProcessService(kModuleId, &SendProcessMessageToHost);
@@ -85,21 +84,18 @@ int32_t Load(hx::core::LoadParmsIn* in, hx::core::LoadParmsOut* out) {
 }
 
 int32_t Unload() {
-  return Guarded("Unload", [] {
-    hx::SetCurrentManager(nullptr);
-    delete g_manager.exchange(nullptr);
-  });
+  return Guarded("Unload", [] { delete hx::TakeCurrentManager(); });
 }
 
 int32_t Open() {
   return Guarded("Open", [] {
-    if (hx::NotifyManager* manager = g_manager.load()) manager->Open();
+    if (hx::NotifyManager* manager = hx::CurrentManager()) manager->Open();
   });
 }
 
 int32_t Close() {
   return Guarded("Close", [] {
-    hx::NotifyManager* manager = g_manager.load();
+    hx::NotifyManager* manager = hx::CurrentManager();
     if (manager == nullptr) return;
     manager->Stop();
     hx::ipc::ShutdownProcessService(true);
@@ -109,14 +105,14 @@ int32_t Close() {
 int32_t Read(hx::core::ReadParmsIn* in) {
   return Guarded("Read", [&] {
     if (in == nullptr || in->mode != hx::core::kReadModeWatchdog) return;
-    if (hx::NotifyManager* manager = g_manager.load()) manager->RunWatchdog();
+    if (hx::NotifyManager* manager = hx::CurrentManager()) manager->RunWatchdog();
   });
 }
 
 int32_t Write(hx::core::WriteParmsIn* in, hx::core::WriteParmsOut* out) {
   return Guarded("Write", [&] {
     if (in == nullptr) return;
-    hx::NotifyManager* manager = g_manager.load();
+    hx::NotifyManager* manager = hx::CurrentManager();
     if (manager == nullptr) {
       // Without a manager no frame is kept; the host keeps its buffer.
       if (in->requestClass == hx::core::kWriteClassFrame && out != nullptr) out->frameKept = 0;
@@ -129,7 +125,7 @@ int32_t Write(hx::core::WriteParmsIn* in, hx::core::WriteParmsOut* out) {
 int32_t IOCTL(hx::core::IoctlParmsIn* in) {
   return Guarded("IOCTL", [&] {
     if (in == nullptr) return;
-    hx::NotifyManager* manager = g_manager.load();
+    hx::NotifyManager* manager = hx::CurrentManager();
     if (manager == nullptr) return;
     switch (in->code) {
       case hx::core::kIoctlRunWorker:

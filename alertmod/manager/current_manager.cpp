@@ -17,4 +17,8 @@ void SetCurrentManager(NotifyManager* manager) {
   g_current.store(manager);
 }
 
+NotifyManager* TakeCurrentManager() {
+  return g_current.exchange(nullptr);
+}
+
 }  // namespace hx

@@ -1,7 +1,8 @@
-// The process's live NotifyManager, as the exports created it. The exports
-// set it at Load and clear it at Unload; the testing module's hooks read it
-// to reach the manager that the host is driving. Any thread may read it; the
-// pointer stays valid only between Load and Unload.
+// The process's one NotifyManager, as the exports create it. The exports
+// set it at Load, read it on every call and take it back at Unload; the
+// testing module's hooks read it to reach the manager that the host is
+// driving. Any thread may read it; the pointer stays valid only between
+// Load and Unload.
 #ifndef ALERTMOD_MANAGER_CURRENT_MANAGER_H_
 #define ALERTMOD_MANAGER_CURRENT_MANAGER_H_
 
@@ -12,8 +13,12 @@ class NotifyManager;
 // The live manager, or null outside Load ... Unload.
 NotifyManager* CurrentManager();
 
-// Called by the exports only.
+// Makes `manager` the live one. Called by the exports only.
 void SetCurrentManager(NotifyManager* manager);
+
+// Clears the live manager and returns what it was, so that exactly one
+// caller gets to destroy it. Called by the exports only.
+NotifyManager* TakeCurrentManager();
 
 }  // namespace hx
 
