@@ -7,9 +7,9 @@
 #include <sys/stat.h>
 
 #include <atomic>
+#include <cstring>
 #include <regex>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include "alertmod/host_records.h"
@@ -139,9 +139,12 @@ class EmailDeliveryTest : public testsupport::ModuleHostTest {
   std::vector<std::vector<std::string>> Started() {
     std::vector<std::vector<std::string>> commands;
     for (const auto& r : host().Requests().OfClass(hx::core::kClassProcess)) {
-      if (r.bytes.size() < 16 || r.bytes[8] != 6) continue;
+      hx::core::ProcessMessageHeader header{};
+      if (r.bytes.size() < hx::core::kProcessHeaderBytes) continue;
+      memcpy(&header, r.bytes.data(), sizeof(header));
+      if (header.type != hx::core::kProcessStart) continue;
       std::vector<std::string> args;
-      std::string payload = r.bytes.substr(16);
+      std::string payload = r.bytes.substr(hx::core::kProcessHeaderBytes);
       size_t start = 0;
       for (size_t end; (end = payload.find('\0', start)) != std::string::npos; start = end + 1) {
         args.push_back(payload.substr(start, end - start));
@@ -152,9 +155,10 @@ class EmailDeliveryTest : public testsupport::ModuleHostTest {
     return commands;
   }
 
-  std::vector<std::string> DataFiles() {
+  // The names in `directory`.
+  static std::vector<std::string> Files(const std::string& directory) {
     std::vector<std::string> names;
-    if (DIR* d = opendir("data")) {
+    if (DIR* d = opendir(directory.c_str())) {
       while (dirent* e = readdir(d)) {
         if (e->d_name[0] != '.') names.push_back(e->d_name);
       }
@@ -162,6 +166,7 @@ class EmailDeliveryTest : public testsupport::ModuleHostTest {
     }
     return names;
   }
+  std::vector<std::string> DataFiles() { return Files("data"); }
   // Moves the module's clock on in steps until `done` holds, giving the
   // worker (which polls its retry queue in real time) a moment after each
   // step. The exact schedule is the retry queue's unit tests' business; here
@@ -191,13 +196,7 @@ TEST_F(EmailDeliveryTest, PlainSmtpDeliversTheComposedFileUnchanged) {
   EXPECT_EQ(Statuses(), std::vector<int>{0});
 
   auto mail = smtp.Messages()[0];
-  std::vector<std::string> copies;
-  if (DIR* d = opendir(dir().File("sent").c_str())) {
-    while (dirent* e = readdir(d)) {
-      if (e->d_name[0] != '.') copies.push_back(e->d_name);
-    }
-    closedir(d);
-  }
+  std::vector<std::string> copies = Files(dir().File("sent"));
   ASSERT_EQ(copies.size(), 1u);
   // SMTP ends the message data with a line break, which curl adds when the
   // file does not end with one; every other byte arrives as composed.
