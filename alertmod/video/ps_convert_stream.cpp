@@ -12,9 +12,8 @@ namespace {
 
 constexpr const char* kCreationTimeFormat = "%Y-%m-%d %H:%M:%S";
 // The streams are English. MP4 and QuickTime store three-letter codes and
-// drop the two-letter "en", so the stream carries its three-letter form.
-constexpr const char* kStreamLanguage = "en";
-constexpr const char* kContainerLanguage = "eng";
+// would drop the two-letter "en", so the stream carries its three-letter form.
+constexpr const char* kStreamLanguage = "eng";
 // A descriptor's size byte of 0 stands for 256 units of 16 pixels.
 constexpr uint32_t kZeroSizeUnitsPixels = 4096;
 constexpr AVRational kStreamTimeBase{1, 90000};
@@ -51,10 +50,6 @@ bool IsNalCodec(uint8_t codec) {
 
 NalCodec NalCodecOf(uint8_t codec) {
   return codec == kPSCodecH265 ? NalCodec::kH265 : NalCodec::kH264;
-}
-
-const char* ContainerLanguage(const char* language) {
-  return strcmp(language, kStreamLanguage) == 0 ? kContainerLanguage : language;
 }
 
 uint32_t PixelsFromUnits(uint8_t units) {
@@ -162,7 +157,7 @@ bool PSConvertAVCodecStream::CreateStream(const IPSConvertStreamInfo& info, uint
   if (!(fps > 0)) return false;
   AVStream* stream = m_libs.avformat_new_stream(m_context, nullptr);
   if (stream == nullptr) return false;
-  m_libs.av_dict_set(&stream->metadata, "language", ContainerLanguage(kStreamLanguage), 0);
+  m_libs.av_dict_set(&stream->metadata, "language", kStreamLanguage, 0);
   AVCodecParameters* parameters = stream->codecpar;
   parameters->codec_type = AVMEDIA_TYPE_VIDEO;
   parameters->codec_id = id;
