@@ -73,11 +73,7 @@ bool CStreamInfo::WriteFrame(const uint8_t* data, uint32_t size, int64_t timeMs,
   packet.flag = flag;
   hx::SetPacketTime(timeMs, &packet);
   if (m_activeClip->muxer->WritePacket(packet) < 0) return false;
-
-  if (frameType == hx::kPSKeyFrame) m_activeClip->keyFrameTimes.push_back(timeMs);
   m_activeClip->LastFrame = timeMs;
-  m_activeClip->flags |= flag;
-  ++m_activeClip->frameCount;
   return true;
 }
 
@@ -100,10 +96,9 @@ void CStreamInfo::OpenClip(int64_t timeMs) {
   auto clip = std::make_unique<ActiveClip>();
   clip->FirstFrame = timeMs;
   clip->LastFrame = timeMs;
-  clip->fileName = m_path;
   clip->muxer = std::make_unique<hx::PSConvertAVCodecStream>(m_libs);
   clip->muxer->SetOptions(ClipMuxerOptions());
-  const int result = clip->muxer->Open(hx::PSFileHeader(), *this, clip->fileName);
+  const int result = clip->muxer->Open(hx::PSFileHeader(), *this, m_path);
   if (result != 0) {
     hx::LogToHost(hx::core::kClipWriterLogSource, m_callback, hx::LogLevelError,
                   "failed to start mp4/mov file for %d: %d", static_cast<int>(m_streamId), result);

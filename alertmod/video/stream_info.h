@@ -60,19 +60,11 @@ class CStreamInfo final : public hx::IPSConvertStreamInfo {
   void Close();
 
   const std::string& Path() const { return m_path; }
-  uint32_t Fps() const { return m_fps; }
-  uint8_t Codec() const { return m_codec; }
-  // Frames written to the open file; 0 when none is open.
-  uint64_t FrameCount() const { return m_activeClip ? m_activeClip->frameCount : 0; }
 
  private:
   struct ActiveClip {
     int64_t FirstFrame = 0;
     int64_t LastFrame = 0;
-    uint8_t flags = 0;
-    uint64_t frameCount = 0;
-    std::string fileName;
-    std::vector<int64_t> keyFrameTimes;
     std::unique_ptr<hx::PSConvertAVCodecStream> muxer;
   };
 
