@@ -120,7 +120,6 @@ void CVideoEmailStream::MarkDone() {
   // Released before the call so that the notifier runs at most once, even
   // if it reaches this stream again.
   std::shared_ptr<INotifyReady> completion = std::move(m_completion);
-  m_completion.reset();
   if (completion) completion->OnReady();
 }
 
