@@ -6,7 +6,6 @@
 
 #include <gtest/gtest.h>
 
-#include <chrono>
 #include <cstdint>
 #include <map>
 #include <memory>
@@ -21,20 +20,12 @@
 
 namespace videotest {
 
-// The module's tick, set by the test while a TestTick lives. The source is
-// installed once per process (the clock keeps every source it was given)
-// and reads the steady clock when no TestTick is alive.
+// The module's tick, set by the test while a TestTick lives; the system's
+// tick again once it is gone.
 class TestTick {
  public:
-  TestTick() {
-    static const bool installed = [] {
-      hx::platform::SetTickSource(&TestTick::Read, nullptr);
-      return true;
-    }();
-    (void)installed;
-    Active() = true;
-  }
-  ~TestTick() { Active() = false; }
+  TestTick() { hx::platform::SetTickSource(&TestTick::Read, nullptr); }
+  ~TestTick() { hx::platform::SetTickSource(nullptr, nullptr); }
   void Set(uint32_t ms) { Now() = ms; }
   void Advance(uint32_t ms) { Now() += ms; }
   uint32_t Get() const { return Now(); }
@@ -44,16 +35,7 @@ class TestTick {
     static uint32_t now = 0;
     return now;
   }
-  static bool& Active() {
-    static bool active = false;
-    return active;
-  }
-  static uint32_t Read(void*) {
-    if (Active()) return Now();
-    const auto since = std::chrono::steady_clock::now().time_since_epoch();
-    return static_cast<uint32_t>(
-        std::chrono::duration_cast<std::chrono::milliseconds>(since).count());
-  }
+  static uint32_t Read(void*) { return Now(); }
 };
 
 // A FakeHost whose buffer releases are counted per buffer address.
