@@ -1,6 +1,7 @@
 #include "alertmod/diag/log.h"
 
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 
 #include <string>
 
@@ -101,11 +102,21 @@ TEST(FileLoggerTest, ReopensAfterAFailedOpen) {
   LogImpl logger;
   logger.SetFileName("missing-dir/log.txt");
   EXPECT_FALSE(logger.Stream().good());
-  logger.SetFileName("log.txt");
+  // The same name is tried again at the next request, once it can be opened.
+  ASSERT_EQ(mkdir("missing-dir", 0755), 0);
   logger.Stream() << "ok\n";
   logger.Stream().flush();
   EXPECT_TRUE(logger.Stream().good());
-  EXPECT_EQ(testsupport::ReadFile("log.txt"), "ok\n");
+  EXPECT_EQ(testsupport::ReadFile("missing-dir/log.txt"), "ok\n");
+}
+
+TEST(FileLoggerTest, ReopensAStreamThatFailedAWrite) {
+  LogImpl logger;
+  logger.SetFileName("/dev/full");
+  logger.Stream() << "lost\n";
+  logger.Stream().flush();
+  // The failed flush left the open stream bad; the next request reopens it.
+  EXPECT_TRUE(logger.Stream().good());
 }
 
 TEST(FileLoggerTest, IsOneProcessWideObject) {
