@@ -15,6 +15,7 @@ class FuzzInput {
   FuzzInput(const uint8_t* data, size_t size) : m_data(data), m_size(size) {}
 
   bool Empty() const { return m_at >= m_size; }
+  size_t Remaining() const { return m_size - std::min(m_at, m_size); }
   uint8_t Byte() { return m_at < m_size ? m_data[m_at++] : 0; }
   uint32_t Word() {
     uint32_t value = 0;
@@ -23,7 +24,7 @@ class FuzzInput {
   }
   // Up to `count` bytes: fewer when the input ends first.
   std::string Bytes(size_t count) {
-    count = std::min(count, m_size - std::min(m_at, m_size));
+    count = std::min(count, Remaining());
     std::string bytes(reinterpret_cast<const char*>(m_data + m_at), count);
     m_at += count;
     return bytes;

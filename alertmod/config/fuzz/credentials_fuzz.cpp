@@ -18,44 +18,38 @@
 
 #include "alertmod/config/credentials.h"
 #include "alertmod/host_records.h"
+#include "tests/support/fuzz_input.h"
 
 namespace {
 
 constexpr uint8_t kMask = 0x5A;
+constexpr size_t kAnswerBytes = 9;
 
+// The answers left in the input, and whether any was used.
 struct Script {
-  const uint8_t* data = nullptr;
-  size_t size = 0;
-  size_t at = 0;
-  bool scripted = false;  // an answer came from the input
-
-  uint32_t Word() {
-    uint32_t value = 0;
-    for (int i = 0; i < 4 && at < size; ++i) value |= uint32_t{data[at++]} << (8 * i);
-    return value;
-  }
+  testsupport::FuzzInput* answers = nullptr;
+  bool scripted = false;
 };
 
 Script g_script;
 
 int32_t HostCallback(hx::core::HostRequest* request, void*) {
   if (request->requestClass != hx::core::kClassCrypto) return 0;
-  Script& script = g_script;
+  testsupport::FuzzInput& answers = *g_script.answers;
   auto* buffer = static_cast<uint8_t*>(request->data);
-  if (script.at + 9 > script.size) {
+  if (answers.Remaining() < kAnswerBytes) {
     if (request->extValue < 0 || static_cast<uint32_t>(request->extValue) > request->length) {
       return -1;
     }
     for (int32_t i = 0; i < request->extValue; ++i) buffer[i] ^= kMask;
     return 0;
   }
-  script.scripted = true;
-  const int32_t result = static_cast<int32_t>(script.Word());
-  request->extValue = static_cast<int32_t>(script.Word());
-  size_t written = script.data[script.at++];
-  written = std::min({written, script.size - script.at, size_t{request->length}});
-  memcpy(buffer, script.data + script.at, written);
-  script.at += written;
+  g_script.scripted = true;
+  const int32_t result = static_cast<int32_t>(answers.Word());
+  request->extValue = static_cast<int32_t>(answers.Word());
+  const size_t written = answers.Byte();
+  const std::string bytes = answers.Bytes(std::min(written, size_t{request->length}));
+  memcpy(buffer, bytes.data(), bytes.size());
   return result;
 }
 
@@ -63,9 +57,9 @@ int32_t HostCallback(hx::core::HostRequest* request, void*) {
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   if (size == 0) return 0;
-  const size_t passwordLength = std::min<size_t>(data[0], size - 1);
-  const std::string password(reinterpret_cast<const char*>(data + 1), passwordLength);
-  g_script = Script{data, size, 1 + passwordLength, false};
+  testsupport::FuzzInput input(data, size);
+  const std::string password = input.Bytes(input.Byte());
+  g_script = Script{&input, false};
   const std::optional<std::string> protectedBytes =
       hx::ProtectPassword(password, hx::core::kModuleId, &HostCallback, {});
   if (!protectedBytes) return 0;
