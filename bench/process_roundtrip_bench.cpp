@@ -7,14 +7,13 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <cstdlib>
-#include <filesystem>
 #include <memory>
 #include <string>
 #include <vector>
 
 #include "host/reference_host.h"
 #include "tests/support/module_hooks.h"
+#include "tests/support/temp_dir.h"
 
 extern char** environ;
 
@@ -25,11 +24,7 @@ const std::string kInput(100, 'x');
 // A host with the testing module started in a fresh working directory.
 class HostSession {
  public:
-  HostSession() {
-    char pattern[] = "/tmp/alertmod-bench-XXXXXX";
-    m_dir = mkdtemp(pattern);
-    m_previous = std::filesystem::current_path();
-    std::filesystem::current_path(m_dir);
+  HostSession() : m_chdir(m_dir.path()) {
     refhost::HostOptions options;
     options.modulePath = ALERTMOD_TESTING_MODULE_PATH;
     options.echoLog = false;
@@ -40,17 +35,12 @@ class HostSession {
       m_run = reinterpret_cast<testhooks::RunProcessFn>(m_host->Hook("RunProcess"));
     }
   }
-  ~HostSession() {
-    m_host.reset();
-    std::filesystem::current_path(m_previous);
-    std::filesystem::remove_all(m_dir);
-  }
-
   testhooks::RunProcessFn run() const { return m_run; }
 
  private:
-  std::string m_dir;
-  std::filesystem::path m_previous;
+  // Destroyed in reverse: the host stops before the directory goes.
+  testsupport::TempDir m_dir;
+  testsupport::ScopedChdir m_chdir;
   std::unique_ptr<refhost::ReferenceHost> m_host;
   testhooks::RunProcessFn m_run = nullptr;
 };

@@ -4,6 +4,8 @@
 #include <limits>
 #include <mutex>
 
+#include "host/system_description.h"
+
 extern "C" {
 #include <libavcodec/avcodec.h>
 #include <libavcodec/bsf.h>
@@ -26,13 +28,13 @@ std::string AvError(const char* what, int code) {
 int HostCodec(AVCodecID id) {
   switch (id) {
     case AV_CODEC_ID_MJPEG:
-      return 0;
+      return kStandardJpeg;
     case AV_CODEC_ID_MPEG4:
-      return 4;
+      return kStandardMpeg4;
     case AV_CODEC_ID_H264:
-      return 5;
+      return kStandardH264;
     case AV_CODEC_ID_HEVC:
-      return 6;
+      return kStandardH265;
     default:
       return -1;
   }
@@ -209,7 +211,7 @@ bool CameraFeed::PlayOnce(std::string* error) {
     }
     const int next = m_demuxer->Next(packet.get(), error);
     if (next <= 0) return next == 0;
-    const bool key = m_format.codec == 0 || (packet->flags & AV_PKT_FLAG_KEY) != 0;
+    const bool key = m_format.codec == kStandardJpeg || (packet->flags & AV_PKT_FLAG_KEY) != 0;
     const int64_t stamp = packet->pts != AV_NOPTS_VALUE ? packet->pts : packet->dts;
     const int64_t timeMs = stamp == AV_NOPTS_VALUE ? 0 : av_rescale_q(stamp, timeBase, {1, 1000});
     if (m_options.realTime) Pace();

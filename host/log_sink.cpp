@@ -31,11 +31,11 @@ LogSink::~LogSink() {
 
 std::string LogSink::LevelName(int32_t level) {
   switch (level) {
-    case 25:
+    case kLogInfo:
       return "INFO";
-    case 50:
+    case kLogWarning:
       return "WARN";
-    case 75:
+    case kLogError:
       return "ERROR";
     default:
       return std::to_string(level);

@@ -14,6 +14,11 @@
 
 namespace refhost {
 
+// The levels of the module's log lines.
+constexpr int32_t kLogInfo = 25;
+constexpr int32_t kLogWarning = 50;
+constexpr int32_t kLogError = 75;
+
 struct LogLine {
   uint32_t source = 0;
   int32_t level = 0;

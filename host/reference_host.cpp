@@ -9,9 +9,6 @@ std::atomic<ReferenceHost*> g_loadedHost{nullptr};
 
 using TestHookLookup = void* (*)(const char* name);
 
-// Level of the host's own fault reports in its log.
-constexpr int32_t kHostFaultLevel = 75;
-
 }  // namespace
 
 ReferenceHost::ReferenceHost(HostOptions options)
@@ -123,7 +120,7 @@ void ReferenceHost::Stop() {
 void ReferenceHost::ReportFrameFaults() {
   // After Unload the module holds no frame; anything not returned is lost.
   const std::string report = m_frames.FaultReport();
-  if (!report.empty()) m_log.Write(0, kHostFaultLevel, "host: " + report);
+  if (!report.empty()) m_log.Write(0, kLogError, "host: " + report);
 }
 
 int32_t ReferenceHost::Write(const hx::core::WriteParmsIn& in, hx::core::WriteParmsOut* out) {

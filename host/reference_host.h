@@ -33,7 +33,7 @@ namespace refhost {
 
 struct HostOptions {
   std::string modulePath;
-  int32_t logThreshold = 25;
+  int32_t logThreshold = kLogInfo;
   std::string logFile;                      // empty: standard error
   bool echoLog = true;                      // write log lines as they come
   bool recordRequests = true;               // keep every request in Requests()

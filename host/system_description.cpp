@@ -4,10 +4,12 @@
 
 #include <utility>
 
+#include "alertmod/host_records.h"
+
 namespace refhost {
 namespace {
 
-constexpr int32_t kAlertModuleId = 0xC0000;  // "Notify" ID of the alert module
+constexpr int32_t kAlertModuleId = static_cast<int32_t>(hx::core::kModuleId);  // its "Notify" ID
 constexpr int32_t kChannelsPerEncoder = 16;
 
 // Adds a new child element named `name` to `parent` and returns it.

@@ -183,9 +183,9 @@ TEST_F(LifecycleTest, WatchdogTicksUntilClose) {
     EXPECT_EQ(tick.requester, 0xC0000u);
     EXPECT_EQ(tick.length, 0u);
   }
+  // Stop returns only once Close has woken the watchdog and its lent thread
+  // has left the module; a watchdog that kept ticking would hang it here.
   host().Stop();
-  size_t afterStop = TickRequests();
-  EXPECT_EQ(TickRequests(), afterStop);
 }
 
 TEST_F(LifecycleTest, AFailingTickIsReportedAndTickingGoesOn) {

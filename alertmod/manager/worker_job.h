@@ -8,6 +8,7 @@
 #include <functional>
 #include <memory>
 
+#include "alertmod/config/notify_cfg.h"
 #include "alertmod/host_records.h"
 #include "alertmod/mail/notify_work_item.h"
 
@@ -15,8 +16,8 @@ namespace hx {
 
 // The configuration values the worker needs between items.
 struct WorkerSettings {
-  int32_t maxRetrySeconds = 172800;
-  int32_t maxRetryQueue = 100;
+  int32_t maxRetrySeconds = kDefaultMaxRetrySeconds;
+  int32_t maxRetryQueue = kDefaultMaxRetryQueue;
 };
 
 class IWorkerJob {

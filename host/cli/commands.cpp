@@ -24,7 +24,6 @@ using scenario::TimelineEntry;
 constexpr char kConfigurationFile[] = "notify.xml";
 constexpr char kHostKeyFile[] = "hostkey.bin";
 constexpr char kLoadedLine[] = "Loaded configuration from disk successfully";
-constexpr int32_t kLevelError = 75;
 constexpr char kTestMessage[] = "Testing Profile";
 
 int Complain(const std::string& message, int status) {
@@ -253,7 +252,7 @@ int ValidateCommand(const CommandLine& line) {
   if (!opened.error.empty())
     return Complain("cannot load the module: " + opened.error, kExitFailed);
   const std::vector<std::string> dropped = DroppedEntries(file, opened.configuration);
-  const bool valid = Logged(opened, kLoadedLine) && !LoggedAtLeast(opened, kLevelError) &&
+  const bool valid = Logged(opened, kLoadedLine) && !LoggedAtLeast(opened, kLogError) &&
                      !opened.configuration.empty() && dropped.empty();
   PrintValidation(line.arguments[0], opened, dropped, valid);
   return valid ? kExitOk : kExitFailed;
@@ -268,7 +267,7 @@ int ShowConfigCommand(const CommandLine& line) {
   if (!opened.error.empty())
     return Complain("cannot load the module: " + opened.error, kExitFailed);
   for (const LogLine& text : opened.log) {
-    if (text.level > 25) {
+    if (text.level > kLogInfo) {
       fprintf(stderr, "module %s: %s\n", LogSink::LevelName(text.level).c_str(), text.text.c_str());
     }
   }

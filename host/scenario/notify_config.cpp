@@ -5,10 +5,12 @@
 #include <algorithm>
 #include <memory>
 
+#include "alertmod/host_records.h"
+
 namespace refhost::scenario {
 namespace {
 
-constexpr int kAlertModuleId = 0xC0000;
+constexpr int kAlertModuleId = static_cast<int>(hx::core::kModuleId);
 
 TiXmlElement* AddChild(TiXmlElement* parent, const char* name) {
   return static_cast<TiXmlElement*>(parent->LinkEndChild(new TiXmlElement(name)));

@@ -5,11 +5,10 @@
 #include <cstdlib>
 #include <ctime>
 
+#include "host/system_description.h"
+
 namespace refhost::scenario {
 namespace {
-
-constexpr int32_t kLevelWarning = 50;
-constexpr int32_t kLevelError = 75;
 
 bool StartsWith(const std::string& text, const char* prefix) {
   return text.compare(0, std::char_traits<char>::length(prefix), prefix) == 0;
@@ -55,14 +54,14 @@ std::string Plural(size_t count, const char* one, const char* many) {
 }
 
 std::string CodecName(uint32_t codec) {
-  switch (codec) {
-    case 0:
+  switch (static_cast<int32_t>(codec)) {
+    case kStandardJpeg:
       return "MJPEG";
-    case 4:
+    case kStandardMpeg4:
       return "MPEG-4";
-    case 5:
+    case kStandardH264:
       return "H.264";
-    case 6:
+    case kStandardH265:
       return "H.265";
     default:
       return "codec " + std::to_string(codec);
@@ -154,8 +153,8 @@ RunTally TallyRun(const RunReport& report) {
     if (status.status == -1) ++tally.reset;
   }
   for (const LogLine& line : report.log) {
-    if (line.level == kLevelWarning) ++tally.warnings;
-    if (line.level >= kLevelError) ++tally.errors;
+    if (line.level == kLogWarning) ++tally.warnings;
+    if (line.level >= kLogError) ++tally.errors;
     TallyDelivery(line.text, &tally);
     TallyAttachment(line.text, &tally);
   }
