@@ -64,7 +64,10 @@ VideoBuffer::~VideoBuffer() = default;
 
 bool VideoBuffer::AddFrame(int32_t streamId, uint32_t frameType, uint32_t payloadOffset,
                            const void* data, uint32_t size, const StreamFormat& format) noexcept {
-  if (data == nullptr || size == 0 || payloadOffset > size) {
+  // A frame must carry picture bytes behind the host's header: the clip
+  // writer takes an empty payload for the end of the clip, so such a frame
+  // would cut off every frame kept after it.
+  if (data == nullptr || payloadOffset >= size) {
     ReportMalformed(streamId, payloadOffset, size);
     return false;
   }

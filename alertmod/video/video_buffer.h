@@ -72,7 +72,8 @@ class VideoBuffer {
   // when the history or a capture kept the frame: the buffer then belongs to
   // the module until it sends the release. Returns false when nothing kept
   // it (no release will ever be sent for it), also for a frame without data
-  // or whose payload offset lies beyond its length. Never throws.
+  // or without picture bytes (payload offset at or beyond its length). Never
+  // throws.
   bool AddFrame(int32_t streamId, uint32_t frameType, uint32_t payloadOffset, const void* data,
                 uint32_t size, const StreamFormat& format) noexcept;
 
