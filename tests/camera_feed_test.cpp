@@ -13,6 +13,10 @@
 #include "host/frame_pool.h"
 #include "tests/support/host_fixture.h"
 
+extern "C" {
+#include <libavutil/log.h>
+}
+
 namespace {
 
 using refhost::CameraFeed;
@@ -226,6 +230,26 @@ TEST_F(CameraFeedTest, ABufferNeverReturnedIsReportedAtShutdown) {
   ASSERT_NE(nullptr, host().Frames().Allocate(64));
   host().Stop();
   EXPECT_TRUE(host().Log().Contains("host: frame buffers: 1 never returned (64 bytes)"));
+}
+
+// The codec libraries live in the host's process too. While the module is
+// loaded their warnings and errors reach the host's log (not its standard
+// error); after Unload they print by themselves again, and no call reaches
+// the module that is gone.
+TEST_F(CameraFeedTest, CodecLibraryWarningsReachTheHostsLogWhileTheModuleIsLoaded) {
+  StartHost();
+  av_log(nullptr, AV_LOG_WARNING, "codec warning %d\n", 1);
+  av_log(nullptr, AV_LOG_ERROR, "codec error\n");
+  av_log(nullptr, AV_LOG_INFO, "codec chatter\n");
+  host().Stop();
+  av_log(nullptr, AV_LOG_WARNING, "codec warning after unload\n");
+  std::vector<std::string> texts;
+  for (const refhost::LogLine& line : host().Log().Lines()) {
+    if (line.text.rfind("codec ", 0) != 0) continue;
+    texts.push_back(line.text);
+    EXPECT_EQ(refhost::kLogWarning, line.level);
+  }
+  EXPECT_EQ((std::vector<std::string>{"codec warning 1", "codec error"}), texts);
 }
 
 }  // namespace

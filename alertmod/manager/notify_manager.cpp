@@ -32,11 +32,13 @@ NotifyManager::NotifyManager(core::HostCallbackFn callback, WorkerJobFactory job
   GetLgr()->SetFileName("notifylog.txt");
   // The codec libraries are loaded while the host loads the module, so that
   // the first clip does not wait for them. Without them the module works on
-  // and sends messages without clips.
-  av_init::Instance();
+  // and sends messages without clips. Their own warnings go to the host's
+  // log rather than its standard error.
+  av_init::Instance().RouteLogTo(callback);
 }
 
 NotifyManager::~NotifyManager() {
+  av_init::Instance().RouteLogTo(nullptr);
   // A waiting notification and its captures hold each other (the item holds
   // the capture, the capture its completion); the item is let go here so
   // that the captures' frames go back to the host with the video buffer.

@@ -1,5 +1,11 @@
 #include "alertmod/video/av_libs.h"
 
+#include <atomic>
+#include <cstdarg>
+#include <cstdio>
+#include <cstring>
+
+#include "alertmod/diag/log.h"
 #include "alertmod/platform/shared_library.h"
 
 // Binds the member named like the symbol; keeps name and member in step.
@@ -12,6 +18,30 @@ std::string LibraryPath(const std::string& directory, const char* baseName, int 
   std::string path = directory;
   if (!path.empty() && path.back() != '/') path.push_back('/');
   return path + "lib" + baseName + ".so." + std::to_string(major);
+}
+
+// The libraries' log callback is one per process and carries no context of
+// ours, so the host it forwards to has to be found here.
+std::atomic<core::HostCallbackFn> g_codecLogHost{nullptr};
+
+// Forwards one message of the libraries. Their informational and debug
+// messages are dropped, as their own printer drops them by default; the
+// rest (for example a muxer's "reserved_moov_size is too small") goes to the
+// host's log instead of the host's standard error.
+void ForwardCodecLog(void* /*context*/, int level, const char* format, va_list arguments) {
+  const core::HostCallbackFn host = g_codecLogHost.load();
+  if (host == nullptr || format == nullptr || level > AV_LOG_WARNING) return;
+  char text[kMaxLogTextLength + 1];
+  va_list copy;
+  va_copy(copy, arguments);
+  const int written = vsnprintf(text, sizeof(text), format, copy);
+  va_end(copy);
+  if (written <= 0) return;
+  size_t length = strnlen(text, sizeof(text));
+  while (length > 0 && (text[length - 1] == '\n' || text[length - 1] == '\r')) --length;
+  if (length == 0) return;
+  text[length] = '\0';
+  LogToHost(core::kModuleId, host, LogLevelWarning, "%s", text);
 }
 
 }  // namespace
@@ -134,6 +164,8 @@ void AVUtilLib::Resolve() {
   ok &= AV_BIND(av_mallocz);
   ok &= AV_BIND(av_get_pix_fmt_name);
   ok &= AV_BIND(av_channel_layout_default);
+  ok &= AV_BIND(av_log_set_callback);
+  ok &= AV_BIND(av_log_default_callback);
   m_resolved = ok && HasModule();
 }
 
@@ -209,6 +241,10 @@ av_init::av_init(const std::string& directory) {
   LoadAll();
 }
 
+av_init::~av_init() {
+  if (m_routesLog) RouteLogTo(nullptr);
+}
+
 av_init& av_init::Instance() {
   // Made on first use rather than during static initialisation, so that a
   // machine without the libraries costs nothing until a clip is wanted.
@@ -224,9 +260,23 @@ void av_init::SetLibraryDirectory(const std::string& directory) {
   SWResampleLib::SetDirectory(directory);
 }
 
+void av_init::RouteLogTo(core::HostCallbackFn host) {
+  g_codecLogHost.store(host);
+  m_routesLog = host != nullptr;
+  InstallLogCallback();
+}
+
 void av_init::AfterAllLoaded() {
   if (AVFormatLib::av_register_all != nullptr) AVFormatLib::av_register_all();
   if (AVFilterLib::avfilter_register_all != nullptr) AVFilterLib::avfilter_register_all();
+  if (m_routesLog) InstallLogCallback();
+}
+
+void av_init::InstallLogCallback() {
+  if (!AllLoaded()) return;
+  // The default printer goes back before the module can be unloaded: the
+  // libraries may outlive it in the host's process.
+  av_log_set_callback(m_routesLog ? &ForwardCodecLog : av_log_default_callback);
 }
 
 }  // namespace hx

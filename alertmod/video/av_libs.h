@@ -22,6 +22,8 @@
 #include <string>
 #include <vector>
 
+#include "alertmod/host_records.h"
+
 extern "C" {
 #include <libavcodec/avcodec.h>
 #include <libavfilter/avfilter.h>
@@ -31,6 +33,7 @@ extern "C" {
 #include <libavutil/channel_layout.h>
 #include <libavutil/dict.h>
 #include <libavutil/frame.h>
+#include <libavutil/log.h>
 #include <libavutil/mathematics.h>
 #include <libavutil/mem.h>
 #include <libavutil/pixdesc.h>
@@ -170,6 +173,8 @@ class AVUtilLib : public LibWrapper {
   decltype(&::av_mallocz) av_mallocz = nullptr;
   decltype(&::av_get_pix_fmt_name) av_get_pix_fmt_name = nullptr;
   decltype(&::av_channel_layout_default) av_channel_layout_default = nullptr;
+  decltype(&::av_log_set_callback) av_log_set_callback = nullptr;
+  decltype(&::av_log_default_callback) av_log_default_callback = nullptr;
 
  private:
   bool m_resolved = false;
@@ -284,6 +289,8 @@ class av_init final : public MultiLibWrapper,
   // Registers the five libraries and loads them, from `directory` when it is
   // not empty (tests), else along the system's search path.
   explicit av_init(const std::string& directory = std::string());
+  // Gives the libraries' log back to their own printer when it was routed.
+  ~av_init() override;
 
   // The process-wide set, loaded along the system's search path on the first
   // call. Lives until the module's static objects are destroyed.
@@ -292,8 +299,20 @@ class av_init final : public MultiLibWrapper,
   // Makes the next loads look in `directory` (empty: the search path).
   void SetLibraryDirectory(const std::string& directory);
 
+  // Sends the libraries' warnings and errors to `host`'s log at warning
+  // level instead of standard error, now and after every later load; null
+  // gives them back to the libraries' own printer. Their log is one per
+  // process, so the last set to route it wins. Call it from one thread at a
+  // time, as loads are.
+  void RouteLogTo(core::HostCallbackFn host);
+
  private:
   void AfterAllLoaded() override;
+  // Points the loaded libraries' log at the routed host, or back at their
+  // own printer.
+  void InstallLogCallback();
+
+  bool m_routesLog = false;
 };
 
 }  // namespace hx

@@ -88,6 +88,8 @@ STUB(av_strdup)
 STUB(av_mallocz)
 STUB(av_get_pix_fmt_name)
 STUB(av_channel_layout_default)
+STUB(av_log_set_callback)
+STUB(av_log_default_callback)
 
 STUB(avfilter_graph_free)
 STUB(av_buffersrc_add_frame_flags)
