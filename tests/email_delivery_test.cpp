@@ -278,7 +278,7 @@ TEST_F(EmailDeliveryTest, FailoverToTheSecondServer) {
   EXPECT_EQ(Started().size(), 3u) << "the probe and two attempts";
 }
 
-TEST_F(EmailDeliveryTest, ServerDownThenUpIsRetriedOnTheBackoffSchedule) {
+TEST_F(EmailDeliveryTest, ServerDownThenUpIsRetriedOnTheBackoffScheduleThroughARejectedUpdate) {
   SmtpTestServer smtp;
   smtp.Stop();
   Start({{"later", smtp.port()}});
@@ -294,6 +294,8 @@ TEST_F(EmailDeliveryTest, ServerDownThenUpIsRetriedOnTheBackoffSchedule) {
   ASSERT_TRUE(AdvanceUntilLog(1s, "Retrying failed notification for file"));
   ASSERT_TRUE(host().Requests().WaitFor([&](const auto&) { return Started().size() >= 3; },
                                         30s));  // probe, send, retry
+  // An update without "Profiles" is rejected: it changes a limit, not the queue.
+  host().SendConfigurationUpdate("<Notify ID=\"786432\" MaxRetryQueue=\"50\"><Servers/></Notify>");
   smtp.Start();
   ASSERT_TRUE(AdvanceUntil(30s, [&] { return !smtp.Messages().empty(); }));
   ASSERT_TRUE(WaitForStatuses(2));

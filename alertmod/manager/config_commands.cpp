@@ -104,7 +104,7 @@ void NotifyManager::LoadConfig() {
   // A file rejected for a missing "Servers" or "Profiles" still sets the
   // three limits it carries; the worker and the video buffer follow them.
   SetVideoBufferLimit(m_config.EmailSizeLimitBytes());
-  PublishConfigSettings();
+  PublishConfigSettings(loaded);
   if (loaded) {
     LogToHost(core::kModuleId, m_callback, LogLevelInfo,
               "Loaded configuration from disk successfully");
@@ -135,13 +135,14 @@ bool NotifyManager::ApplyConfigurationUpdate(const TiXmlDocument& document) {
   if (!m_config.Parse(document, m_configServices)) {
     // An update without "Servers" or "Profiles" is rejected after its three
     // limits were read; they stay, so the worker and the video buffer must
-    // hear of them. Nothing is saved, posted or reported.
+    // hear of them. Nothing is saved, posted or reported, and the messages
+    // waiting for a retry stay: their servers have not changed.
     ApplyLimitChanges(previous);
     return false;
   }
   LogToHost(core::kModuleId, m_callback, LogLevelInfo, "Updated configuration successfully");
   PostConfig();
-  PublishConfigSettings();
+  PublishConfigSettings(true);
   ProfileStatusDocument status;
   for (int32_t id : ProfilesToReset(previous, m_config)) {
     ReportProfileStatus(status, id, kProfileStatusUnknown, m_callback);
@@ -155,7 +156,7 @@ bool NotifyManager::ApplyConfigurationUpdate(const TiXmlDocument& document) {
 void NotifyManager::ApplyLimitChanges(const NotifyCfg& before) {
   if (before.MaxRetrySeconds() != m_config.MaxRetrySeconds() ||
       before.MaxRetryQueue() != m_config.MaxRetryQueue()) {
-    PublishConfigSettings();
+    PublishConfigSettings(false);
   }
   if (before.EmailSizeLimitMB() != m_config.EmailSizeLimitMB()) {
     SetVideoBufferLimit(m_config.EmailSizeLimitBytes());
@@ -176,11 +177,11 @@ bool NotifyManager::ApplySecondReviewer(const TiXmlDocument& document) {
   return true;
 }
 
-void NotifyManager::PublishConfigSettings() {
+void NotifyManager::PublishConfigSettings(bool configurationReplaced) {
   WorkerSettings settings;
   settings.maxRetrySeconds = m_config.MaxRetrySeconds();
   settings.maxRetryQueue = m_config.MaxRetryQueue();
-  PublishWorkerSettings(settings);
+  PublishWorkerSettings(settings, configurationReplaced);
 }
 
 void NotifyManager::SetVideoBufferLimit(int64_t bytes) {

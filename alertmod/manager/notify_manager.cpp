@@ -71,17 +71,23 @@ size_t NotifyManager::QueuedCount() const {
   return m_workQueue.size();
 }
 
-void NotifyManager::PublishWorkerSettings(const WorkerSettings& settings) {
+void NotifyManager::PublishWorkerSettings(const WorkerSettings& settings,
+                                          bool configurationReplaced) {
   std::lock_guard<std::mutex> lock(m_queueMutex);
   m_workerSettings = settings;
   m_settingsChanged = true;
+  // New limits alone arriving before the worker looks must not hide an
+  // accepted configuration published before them.
+  m_configReplaced = m_configReplaced || configurationReplaced;
 }
 
-bool NotifyManager::TakeSettingsChange(WorkerSettings* settings) {
+bool NotifyManager::TakeSettingsChange(WorkerSettings* settings, bool* replaced) {
   std::lock_guard<std::mutex> lock(m_queueMutex);
   *settings = m_workerSettings;
+  *replaced = m_configReplaced;
   bool changed = m_settingsChanged;
   m_settingsChanged = false;
+  m_configReplaced = false;
   return changed;
 }
 
@@ -126,12 +132,13 @@ void NotifyManager::RunWorker() {
   } marker{this};
 
   WorkerSettings settings;
-  TakeSettingsChange(&settings);
+  bool replaced = false;
+  TakeSettingsChange(&settings, &replaced);
   std::unique_ptr<IWorkerJob> job = m_jobFactory();
   job->Start(settings);
   for (;;) {
     std::shared_ptr<NotifyWorkItem> item = TakeItem(*job);
-    if (TakeSettingsChange(&settings)) job->OnConfigurationChanged(settings);
+    if (TakeSettingsChange(&settings, &replaced)) job->OnSettingsChanged(settings, replaced);
     if (!item) {
       job->RetryPass();
       continue;

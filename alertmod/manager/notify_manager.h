@@ -139,8 +139,9 @@ class NotifyManager {
   const NotifyCfg& Config() const { return m_config; }
 
   // Hands new retry settings to the worker, which applies them before its next
-  // item. Any thread.
-  void PublishWorkerSettings(const WorkerSettings& settings);
+  // item. `configurationReplaced` when they come with an accepted
+  // configuration: the worker then also empties its retry queue. Any thread.
+  void PublishWorkerSettings(const WorkerSettings& settings, bool configurationReplaced);
 
   // The watchdog's period for managers created from now on (default 10 s).
   static void SetWatchdogPeriod(std::chrono::milliseconds period);
@@ -175,12 +176,14 @@ class NotifyManager {
   void ApplyFullDocument(const TiXmlDocument& document, const TiXmlElement& trellan);
   void ApplyLimitChanges(const NotifyCfg& before);
   std::shared_ptr<NotifyWorkItem> TakeItem(const IWorkerJob& job);
-  bool TakeSettingsChange(WorkerSettings* settings);
+  // Whether settings were published since the last call; `*replaced` tells
+  // whether an accepted configuration came with them.
+  bool TakeSettingsChange(WorkerSettings* settings, bool* replaced);
   void RunItem(IWorkerJob& job, NotifyWorkItem& item);
   void MarkStopped();
   void SendTick();
   void LoadConfig();
-  void PublishConfigSettings();
+  void PublishConfigSettings(bool configurationReplaced);
   void SetVideoBufferLimit(int64_t bytes);
   static ConfigServices MakeConfigServices(core::HostCallbackFn callback);
 
@@ -196,6 +199,7 @@ class NotifyManager {
   std::deque<std::shared_ptr<NotifyWorkItem>> m_workQueue;
   WorkerSettings m_workerSettings;  // guarded by m_queueMutex
   bool m_settingsChanged = false;   // guarded by m_queueMutex
+  bool m_configReplaced = false;    // guarded by m_queueMutex
 
   std::vector<std::shared_ptr<SNOTIFY_CALLBACK>> m_pending;
   std::vector<std::shared_ptr<SNOTIFY_CALLBACK>> m_ready;

@@ -58,7 +58,7 @@ class RecordingJob final : public IWorkerJob {
     std::lock_guard<std::mutex> lock(m_shared->mutex);
     return m_shared->pendingRetries;
   }
-  void OnConfigurationChanged(const WorkerSettings& settings) override {
+  void OnSettingsChanged(const WorkerSettings& settings, bool) override {
     Update([&] { m_shared->settingsChanges.push_back(settings); });
   }
   void Run(NotifyWorkItem& item) override {
@@ -209,7 +209,7 @@ TEST_F(NotifyManagerTest, NewSettingsReachTheJobBeforeItsNextItem) {
   StartWorker();
   m_manager.QueueWorkItem(Item(1), false);
   ASSERT_TRUE(m_job.WaitUntil([&] { return m_job.ran.size() == 1; }));
-  m_manager.PublishWorkerSettings(WorkerSettings{60, 2});
+  m_manager.PublishWorkerSettings(WorkerSettings{60, 2}, true);
   m_manager.QueueWorkItem(Item(2), false);
   m_job.Release();
   ASSERT_TRUE(m_job.WaitUntil([&] { return m_job.ran.size() == 2; }));

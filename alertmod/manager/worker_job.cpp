@@ -22,9 +22,11 @@ class NotificationWorkerJob final : public IWorkerJob {
     m_settings = settings;
   }
   bool HasPendingRetries() const override { return m_helper && !m_helper->Retries().Empty(); }
-  void OnConfigurationChanged(const WorkerSettings& settings) override {
-    NotifyFileStreamImpl stream(m_callback);
-    m_helper->Retries().Clear(*m_helper, stream);
+  void OnSettingsChanged(const WorkerSettings& settings, bool configurationReplaced) override {
+    if (configurationReplaced) {
+      NotifyFileStreamImpl stream(m_callback);
+      m_helper->Retries().Clear(*m_helper, stream);
+    }
     m_settings = settings;
   }
   void Run(NotifyWorkItem& item) override {

@@ -28,8 +28,11 @@ class IWorkerJob {
   // True while failed messages wait for a retry; the worker then polls
   // instead of blocking on the queue.
   virtual bool HasPendingRetries() const = 0;
-  // The configuration changed since the previous item.
-  virtual void OnConfigurationChanged(const WorkerSettings& settings) = 0;
+  // New settings arrived since the previous item. `configurationReplaced`
+  // when an accepted configuration replaced the servers and profiles
+  // meanwhile: the messages queued for retry belong to the old one and are
+  // dropped. Otherwise (new limits alone) the queue stays.
+  virtual void OnSettingsChanged(const WorkerSettings& settings, bool configurationReplaced) = 0;
   // Runs one notification. May block for as long as delivery takes.
   virtual void Run(NotifyWorkItem& item) = 0;
   // Offers the retry queue one attempt.

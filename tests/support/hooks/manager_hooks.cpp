@@ -66,8 +66,8 @@ class RecordingJob final : public hx::IWorkerJob {
 
   void Start(const hx::WorkerSettings& settings) override { m_inner->Start(settings); }
   bool HasPendingRetries() const override { return m_inner->HasPendingRetries(); }
-  void OnConfigurationChanged(const hx::WorkerSettings& settings) override {
-    m_inner->OnConfigurationChanged(settings);
+  void OnSettingsChanged(const hx::WorkerSettings& settings, bool configurationReplaced) override {
+    m_inner->OnSettingsChanged(settings, configurationReplaced);
   }
   void Run(hx::NotifyWorkItem& item) override {
     m_recorder(RecordItem(item), m_context);
@@ -98,7 +98,7 @@ class DroppingJob final : public hx::IWorkerJob {
  public:
   void Start(const hx::WorkerSettings&) override {}
   bool HasPendingRetries() const override { return false; }
-  void OnConfigurationChanged(const hx::WorkerSettings&) override {}
+  void OnSettingsChanged(const hx::WorkerSettings&, bool) override {}
   void Run(hx::NotifyWorkItem&) override {}
   void RetryPass() override {}
   void Stop() override {}
