@@ -9,6 +9,7 @@
 #include <string>
 #include <vector>
 
+#include "alertmod/config/xml_document.h"
 #include "host/system_description.h"
 #include "tests/manager_fixture.h"
 
@@ -343,6 +344,12 @@ TEST_F(AlarmDocumentsTest, MalformedTruncatedAndHugeDocumentsChangeNothing) {
   for (size_t i = 0; i < noise.size(); ++i) noise[i] = static_cast<char>((i * 7919) >> 3);
   const std::string hugeValue =
       "<Trellan Delta=\"0\"><Servers><Server Serial=\"" + std::string(kTenMB, 'x') + "\"";
+  // Documents whose root has more attributes than are allowed; each quoted
+  // value looks like more attributes and a tag end.
+  std::string attributes;
+  for (size_t i = 0; i <= hx::kMaxXmlAttributes; ++i) {
+    attributes += " a" + std::to_string(i) + "='b=\"c\" />'";
+  }
   const std::string documents[] = {
       "<",
       "<Trellan",
@@ -356,6 +363,8 @@ TEST_F(AlarmDocumentsTest, MalformedTruncatedAndHugeDocumentsChangeNothing) {
       noise,
       hugeValue,
       "<Trellan><Servers><Server Serial=\"SN-3\"></Servers></Trellan>",
+      "<Trellan" + attributes + alarmText.substr(alarmText.find("<Trellan") + 8),
+      "<Trellan" + attributes + systemText.substr(systemText.find("<Trellan") + 8),
   };
   for (const std::string& text : documents) {
     host().WriteDocument(text, kAlarmSender);
@@ -371,6 +380,8 @@ TEST_F(AlarmDocumentsTest, MalformedTruncatedAndHugeDocumentsChangeNothing) {
 
   EXPECT_EQ(snapshot(), before);
   EXPECT_EQ(ItemCountAfterQuiet(), 0u);
+  EXPECT_TRUE(host().Log().Contains("has more than " + std::to_string(hx::kMaxXmlAttributes) +
+                                    " attributes."));
   // The module still works.
   SendAlarm(alarm);
   ASSERT_TRUE(WaitForItems(1));

@@ -87,6 +87,29 @@ TEST_F(SystemDocumentsTest, DeltaDecidesWhatADocumentChanges) {
   EXPECT_NE(Posted().find("description=\"New\""), std::string::npos);
 }
 
+TEST_F(SystemDocumentsTest, CameraNamesKeepTheirCharacters) {
+  StartWith(NotifyFile({ProfileSetting{1, "Front door"}}));
+  struct Case {
+    const char* declaration;
+    const char* written;
+    const char* name;
+  };
+  const Case cases[] = {
+      {"<?xml ?>", "Caf&#xE9; &#x20AC;", "Caf\xC3\xA9 \xE2\x82\xAC"},
+      {"<?xml ?>", "Caf\xC3\xA9 \xE2\x82\xAC", "Caf\xC3\xA9 \xE2\x82\xAC"},
+      // Not UTF-8: read byte by byte.
+      {"<?xml ?>", "Caf\xE9 \xC3", "Caf\xE9 \xC3"},
+      // Without a declaration, references name single bytes.
+      {"", "Caf&#xE9;", "Caf\xE9"},
+  };
+  for (const Case& c : cases) {
+    std::string document = c.declaration + refhost::BuildSystemDocument(OneCamera(1, "NAME"));
+    document.replace(document.find("NAME"), 4, c.written);
+    host().SendHostDocument(document);
+    EXPECT_EQ(NameOfCamera(1), c.name) << c.written;
+  }
+}
+
 TEST_F(SystemDocumentsTest, CompressedCameraIsServedByItsSmallestStillStream) {
   StartWith(NotifyFile({ProfileSetting{1, "Front door"}}));
   refhost::SystemDescription system = OneCamera(1, "Lobby");

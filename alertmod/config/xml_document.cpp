@@ -5,6 +5,8 @@
 #include <algorithm>
 #include <cstring>
 
+#include "alertmod/diag/log.h"
+
 namespace hx {
 namespace {
 
@@ -31,15 +33,18 @@ bool IsNameChar(unsigned char c) {
   return IsNameStart(c) || IsDigit(c) || c == '-' || c == '.' || c == ':';
 }
 
-// Walks a text as TinyXML's parser reads it, keeping only the nesting depth.
-// Wherever the two could read a byte differently the walk gives up, so the
-// depth it reports is never below the one TinyXML builds.
+// Walks a text as TinyXML's parser reads it, keeping only the nesting depth
+// and counting the attributes of each start tag. Wherever the two could read
+// a byte differently the walk gives up, so the depth it reports is never
+// below the one TinyXML builds.
 class NestingWalk final {
  public:
   explicit NestingWalk(const std::string& text)
       : m_text(text.c_str()), m_length(std::strlen(text.c_str())) {}
 
   std::optional<size_t> Run(size_t limit);
+  // Whether Run gave up at a start tag with more than kMaxXmlAttributes.
+  bool TooManyAttributes() const { return m_tooManyAttributes; }
 
  private:
   enum class Tag { kBroken, kEmpty, kOpen };
@@ -61,6 +66,7 @@ class NestingWalk final {
   const char* m_text;
   size_t m_length;
   size_t m_pos = 0;
+  bool m_tooManyAttributes = false;
 };
 
 std::optional<size_t> NestingWalk::Run(size_t limit) {
@@ -125,7 +131,8 @@ bool NestingWalk::SkipPast(const char* terminator) {
 }
 
 // Names of the host's documents are ASCII; a byte above 0x7F in markup could
-// be white space to TinyXML under some locale, so the walk stops there.
+// be white space to TinyXML under some locale (and its UTF-8 mode skips a
+// byte order mark anywhere), so the walk stops there.
 bool NestingWalk::SkipName() {
   if (!IsNameStart(Peek())) {
     return false;
@@ -159,7 +166,11 @@ bool NestingWalk::SkipAttribute() {
 NestingWalk::Tag NestingWalk::SkipStartTag() {
   ++m_pos;  // "<"
   if (!SkipName()) return Tag::kBroken;
-  for (;;) {
+  for (size_t attributes = 0;; ++attributes) {
+    if (attributes > kMaxXmlAttributes) {
+      m_tooManyAttributes = true;
+      return Tag::kBroken;
+    }
     SkipSpace();
     if (AtEnd()) return Tag::kBroken;
     if (Peek() == '/') {
@@ -197,23 +208,69 @@ bool NestingWalk::SkipDeclaration() {
   return false;
 }
 
+// TinyXML's own choice for a text (TIXML_DEFAULT_ENCODING: a byte order mark
+// means UTF-8, and so does a declaration naming no encoding or UTF-8), except
+// that a text which is not UTF-8 is read byte by byte.
+TiXmlEncoding EncodingOf(const std::string& text, bool byteOrderMark) {
+  if (!IsValidUtf8(text)) return TIXML_ENCODING_LEGACY;
+  return byteOrderMark ? TIXML_ENCODING_UTF8 : TIXML_DEFAULT_ENCODING;
+}
+
 }  // namespace
+
+bool IsValidUtf8(const std::string& text) {
+  const auto* p = reinterpret_cast<const unsigned char*>(text.c_str());
+  while (*p != 0) {
+    const unsigned char lead = *p++;
+    if (lead < 0x80) continue;
+    size_t continuations = 0;
+    // The range of the first continuation byte; the others lie in 80..BF.
+    unsigned char low = 0x80;
+    unsigned char high = 0xBF;
+    if (lead >= 0xC2 && lead <= 0xDF) {
+      continuations = 1;
+    } else if (lead >= 0xE0 && lead <= 0xEF) {
+      continuations = 2;
+      low = lead == 0xE0 ? 0xA0 : low;
+      high = lead == 0xED ? 0x9F : high;
+    } else if (lead >= 0xF0 && lead <= 0xF4) {
+      continuations = 3;
+      low = lead == 0xF0 ? 0x90 : low;
+      high = lead == 0xF4 ? 0x8F : high;
+    } else {
+      return false;
+    }
+    for (size_t i = 0; i < continuations; ++i, ++p) {
+      if (*p < (i == 0 ? low : 0x80) || *p > (i == 0 ? high : 0xBF)) return false;
+    }
+  }
+  return true;
+}
 
 std::optional<size_t> XmlNestingDepth(const std::string& text, size_t limit) {
   return NestingWalk(text).Run(limit);
 }
 
-bool ParseXmlDocument(const std::string& text, TiXmlDocument& document) {
+bool ParseXmlDocument(const std::string& text, TiXmlDocument& document,
+                      core::HostCallbackFn callback) {
   document.Clear();
-  // The single-byte mode does not skip a byte order mark itself.
-  const size_t start = text.compare(0, 3, kByteOrderMark) == 0 ? 3 : 0;
-  std::string padded(text, start);
-  const std::optional<size_t> depth = XmlNestingDepth(padded, kMaxXmlNesting);
+  // The walk and the single-byte mode do not skip a byte order mark; the
+  // encoding it stands for is passed to TinyXML instead.
+  const bool byteOrderMark = text.compare(0, 3, kByteOrderMark) == 0;
+  std::string padded(text, byteOrderMark ? 3 : 0);
+  NestingWalk walk(padded);
+  const std::optional<size_t> depth = walk.Run(kMaxXmlNesting);
+  if (walk.TooManyAttributes()) {
+    LogToHost(core::kModuleId, callback, LogLevelWarning,
+              "An XML document was refused: one of its elements has more than %zu attributes.",
+              kMaxXmlAttributes);
+  }
   if (!depth || *depth > kMaxXmlNesting) {
     return false;
   }
+  const TiXmlEncoding encoding = EncodingOf(padded, byteOrderMark);
   padded.append(kSpareNulBytes, '\0');
-  document.Parse(padded.c_str(), nullptr, TIXML_ENCODING_LEGACY);
+  document.Parse(padded.c_str(), nullptr, encoding);
   if (document.Error()) {
     document.Clear();
     return false;

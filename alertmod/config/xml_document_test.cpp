@@ -14,6 +14,13 @@ std::string Nested(size_t levels, const std::string& open = "<Trellan>",
   return text;
 }
 
+// One element with `count` attributes, whose values look like more of them.
+std::string WithAttributes(size_t count) {
+  std::string text = "<a";
+  for (size_t i = 0; i < count; ++i) text += " v" + std::to_string(i) + "='w=\"x\" />'";
+  return text + "/>";
+}
+
 TEST(XmlDocumentTest, MeasuresNestingAsTinyXmlReadsIt) {
   struct Case {
     std::string text;
@@ -38,6 +45,8 @@ TEST(XmlDocumentTest, MeasuresNestingAsTinyXmlReadsIt) {
       {"<a\xC3\xA9/>", std::nullopt},  // a non-ASCII name
       {"<a v=\"caf\xC3\xA9\">caf\xC3\xA9</a>", 1},
       {std::string("<a>\0<b><c>", 10), std::nullopt},  // TinyXML stops at the NUL
+      {WithAttributes(kMaxXmlAttributes), 1},
+      {WithAttributes(kMaxXmlAttributes + 1), std::nullopt},
   };
   for (const Case& c : cases) {
     EXPECT_EQ(XmlNestingDepth(c.text, 100), c.depth) << c.text;

@@ -124,7 +124,10 @@ void MakeTestNotification(NotifyWorkItem& item) {
 void NotifyManager::OnAlarmDocument(const void* data, uint32_t length) {
   if (data == nullptr || length == 0) return;
   TiXmlDocument document;
-  if (!ParseXmlDocument(std::string(static_cast<const char*>(data), length), document)) return;
+  if (!ParseXmlDocument(std::string(static_cast<const char*>(data), length), document,
+                        m_callback)) {
+    return;
+  }
   const TiXmlElement* root = document.RootElement();
   if (root == nullptr) return;
   ReadServerIdentity(*root, m_server);

@@ -177,7 +177,10 @@ bool ApplyAnalyticsAliases(const TiXmlElement& root, SourceAliases& aliases,
 void NotifyManager::OnHostDocument(const void* data, uint32_t length) {
   if (data == nullptr || length == 0) return;
   TiXmlDocument document;
-  if (!ParseXmlDocument(std::string(static_cast<const char*>(data), length), document)) return;
+  if (!ParseXmlDocument(std::string(static_cast<const char*>(data), length), document,
+                        m_callback)) {
+    return;
+  }
   const TiXmlElement* trellan = document.FirstChildElement("Trellan");
   if (trellan == nullptr) return;
   std::optional<int32_t> delta = IntAttribute(*trellan, "Delta");

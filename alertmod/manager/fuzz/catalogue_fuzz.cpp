@@ -96,7 +96,8 @@ void CheckNestingGuard(const std::string& text) {
   std::string padded(text.c_str());
   padded.append(8, '\0');
   TiXmlDocument raw;
-  raw.Parse(padded.c_str(), nullptr, TIXML_ENCODING_LEGACY);
+  raw.Parse(padded.c_str(), nullptr,
+            hx::IsValidUtf8(text) ? TIXML_DEFAULT_ENCODING : TIXML_ENCODING_LEGACY);
   Check(TreeDepth(raw) <= *walked);
 }
 
