@@ -11,6 +11,7 @@
 #include <string>
 #include <vector>
 
+#include "host/password_service.h"
 #include "tests/support/host_fixture.h"
 #include "tests/support/module_hooks.h"
 
@@ -167,6 +168,45 @@ TEST_F(ConfigCommandsTest, PasswordIsProtectedOnDiskAndClearOnlyForTheHost) {
   EXPECT_TRUE(Logged("Loaded configuration from disk successfully"));
   EXPECT_EQ(AttributeOf(Posted(), "Authentication", "password"), kPassword);
   ExpectPasswordNowhereInClear(kPassword);
+}
+
+TEST_F(ConfigCommandsTest, StoredPasswordOutlivesSavesTheHostCannotProtect) {
+  using Answer = int32_t (*)(hx::core::HostRequest&);
+  const Answer refusals[] = {
+      [](hx::core::HostRequest&) { return refhost::PasswordService::kCipherFailure; },
+      [](hx::core::HostRequest& r) {
+        r.extValue = 0;
+        return 0;
+      },
+      [](hx::core::HostRequest& r) {
+        r.extValue = static_cast<int32_t>(r.length) + 1;
+        return 0;
+      },
+  };
+  for (const Answer refuse : refusals) {
+    ASSERT_TRUE(WriteFile(
+        "notify.xml", "<Trellan>" + Notify(Server("main", kPassword), Profile(1)) + "</Trellan>"));
+    StartHost();
+    refhost::PasswordService keys(Options().hostKeyFile);
+    host().SetHandler(hx::core::kClassCrypto, [&](hx::core::HostRequest& r) {
+      return r.code == hx::core::kCodeEncrypt ? refuse(r) : keys.Handle(r);
+    });
+    ASSERT_EQ(ApplyUpdate(Notify(Server("main", kPassword), Profile(1, "new@example"))), 1);
+    EXPECT_TRUE(Logged("notify.xml keeps the one stored before."));
+    // A server with nothing stored yet: the file stays as it was.
+    const std::string saved = ReadFile("notify.xml");
+    ASSERT_EQ(ApplyUpdate(Notify(Server("main", kPassword) + Server("spare"), Profile(1))), 1);
+    EXPECT_TRUE(
+        Logged("The password of SMTP server spare could not be protected; notify.xml is "
+               "left unchanged."));
+    EXPECT_EQ(ReadFile("notify.xml"), saved);
+    host().Stop();
+
+    StartHost();
+    EXPECT_EQ(AttributeOf(Posted(), "Authentication", "password"), kPassword);
+    EXPECT_NE(Posted().find("new@example"), std::string::npos);
+    host().Stop();
+  }
 }
 
 TEST_F(ConfigCommandsTest, UnreadablePasswordIsKeptAndTheRestIsPosted) {

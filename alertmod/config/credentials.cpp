@@ -96,7 +96,14 @@ std::optional<std::string> Transform(const CryptoDirection& direction, const std
 
 std::optional<std::string> ProtectPassword(const std::string& password, uint32_t requester,
                                            core::HostCallbackFn callback, const ErrorSink& sink) {
-  return Transform(kEncrypt, kMarker + password, requester, callback, sink);
+  std::optional<std::string> output =
+      Transform(kEncrypt, kMarker + password, requester, callback, sink);
+  // Nothing could be decrypted from no bytes: the password would be lost.
+  if (output && output->empty()) {
+    Report(sink, kEncrypt.errorText + std::string("empty output"));
+    return std::nullopt;
+  }
+  return output;
 }
 
 std::optional<std::string> UnprotectPassword(const std::string& protectedBytes, uint32_t requester,

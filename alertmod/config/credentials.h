@@ -24,8 +24,9 @@ using ErrorSink = std::function<void(const std::string& text)>;
 // twice the input when that is 512 bytes or more) and may ask once more for
 // a larger one: the sink then gets "Resizing encryption buffer: N", and
 // after a second request "Encryption Failure, reached max attempts". A
-// negative answer gives "encryption error: N". Requests of more than 1 MiB
-// and output lengths outside the buffer are refused as errors.
+// negative answer gives "encryption error: N". Requests of more than 1 MiB,
+// output lengths outside the buffer and an empty output are refused as
+// errors.
 std::optional<std::string> ProtectPassword(const std::string& password, uint32_t requester,
                                            core::HostCallbackFn callback, const ErrorSink& sink);
 

@@ -45,6 +45,7 @@ void ReadAuthentication(const TiXmlElement& authentication, SmtpServer& server,
                                                        services.callback, services.errorSink);
   if (clear) {
     server.password = *clear;
+    server.storedPassword = password;
     return;
   }
   // Nothing is lost: the stored text goes back to the file unchanged, and
@@ -56,19 +57,24 @@ void ReadAuthentication(const TiXmlElement& authentication, SmtpServer& server,
                        "password is entered again.");
 }
 
-// A server the host sends back with an empty password keeps the stored text
-// that could not be read: the host was shown no password for it, so an empty
-// one means "unchanged", not "removed".
-void KeepUnreadablePasswords(const std::vector<SmtpServer>& previous,
-                             std::vector<SmtpServer>& servers) {
+// A server the host sends back keeps what notify.xml holds for the same
+// account. With an empty password, that is the stored text that could not
+// be read: the host was shown no password for it, so an empty one means
+// "unchanged", not "removed". In any case, it is the stored protected form,
+// written again when the host cannot protect the password at a save.
+void KeepStoredPasswords(const std::vector<SmtpServer>& previous,
+                         std::vector<SmtpServer>& servers) {
   for (SmtpServer& server : servers) {
-    if (!server.password.empty() || !server.unreadablePassword.empty()) continue;
+    const bool passwordSent = !server.password.empty();
     for (const SmtpServer& old : previous) {
-      if (!old.unreadablePassword.empty() && old.description == server.description &&
-          old.address == server.address && old.username == server.username) {
-        server.unreadablePassword = old.unreadablePassword;
-        break;
+      if (old.description != server.description || old.address != server.address ||
+          old.username != server.username) {
+        continue;
       }
+      if (!passwordSent && server.unreadablePassword.empty()) {
+        server.unreadablePassword = old.unreadablePassword;
+      }
+      if (server.storedPassword.empty()) server.storedPassword = old.storedPassword;
     }
   }
 }
@@ -92,25 +98,32 @@ void AppendTextElement(TiXmlElement& parent, const char* name, const std::string
   AppendElement(parent, name)->LinkEndChild(new TiXmlText(text));
 }
 
-void WriteAuthentication(TiXmlElement& smtp, const SmtpServer& server,
+void ReportUnprotected(const ConfigServices& services, const SmtpServer& server, bool keptStored) {
+  const char* outcome =
+      keptStored ? "notify.xml keeps the one stored before." : "notify.xml is left unchanged.";
+  Report(services, "The password of SMTP server " + server.description +
+                       " could not be protected; " + outcome);
+}
+
+// Returns false when the password could not be protected and no stored form
+// of it is known; it is then left out, since a password is never written in
+// clear.
+bool WriteAuthentication(TiXmlElement& smtp, const SmtpServer& server,
                          const ConfigServices& services) {
   TiXmlElement* authentication = AppendElement(smtp, "Authentication");
   authentication->SetAttribute("username", server.username);
-  if (server.password.empty() && !server.unreadablePassword.empty()) {
-    authentication->SetAttribute("password", server.unreadablePassword);
-    authentication->SetAttribute("encrypt", kEncryptMarker);
-    return;
+  // A password that could not be read goes back as it was stored.
+  std::string text = server.unreadablePassword;
+  if (!server.password.empty() || text.empty()) {
+    std::optional<std::string> protectedBytes =
+        ProtectPassword(server.password, core::kModuleId, services.callback, services.errorSink);
+    text = protectedBytes ? Base64Encode(*protectedBytes) : server.storedPassword;
+    if (!protectedBytes) ReportUnprotected(services, server, !text.empty());
   }
-  std::optional<std::string> protectedBytes =
-      ProtectPassword(server.password, core::kModuleId, services.callback, services.errorSink);
-  if (!protectedBytes) {
-    // A password is never written in clear.
-    Report(services, "The password of SMTP server " + server.description +
-                         " could not be protected and is left out of notify.xml.");
-    return;
-  }
-  authentication->SetAttribute("password", Base64Encode(*protectedBytes));
+  if (text.empty()) return false;
+  authentication->SetAttribute("password", text);
   authentication->SetAttribute("encrypt", kEncryptMarker);
+  return true;
 }
 
 void WriteProfile(TiXmlElement& profiles, const NotifyProfile& profile) {
@@ -147,6 +160,13 @@ bool HasRequiredProfileParts(const TiXmlElement& smtp) {
   if (FirstChildText(smtp.FirstChildElement("to")).empty()) return false;
   const TiXmlElement* body = smtp.FirstChildElement("body");
   return body == nullptr || body->NextSiblingElement("body") == nullptr;
+}
+
+// The first "Servers" element of a configuration document, or null.
+const TiXmlElement* ServersElement(const TiXmlDocument& document) {
+  const TiXmlElement* root = document.FirstChildElement();
+  const TiXmlElement* notify = root != nullptr ? root->FirstChildElement("Notify") : nullptr;
+  return notify != nullptr ? notify->FirstChildElement("Servers") : nullptr;
 }
 
 void ApplyEventPreAlarm(const TiXmlElement& container, std::map<int32_t, int32_t>& table) {
@@ -193,7 +213,7 @@ void NotifyCfg::ReadServers(const TiXmlElement& firstServers, const ConfigServic
        servers = servers->NextSiblingElement("Servers")) {
     ParseSmtpServers(*servers, m_servers, services);
   }
-  KeepUnreadablePasswords(previous, m_servers);
+  KeepStoredPasswords(previous, m_servers);
 }
 
 void NotifyCfg::ReadProfiles(const TiXmlElement& profiles, const ConfigServices& services) {
@@ -260,7 +280,8 @@ void ParseSmtpServers(const TiXmlElement& serversElement, std::vector<SmtpServer
   }
 }
 
-std::unique_ptr<TiXmlElement> NotifyCfg::ToXml(const ConfigServices& services) const {
+std::unique_ptr<TiXmlElement> NotifyCfg::ToXml(const ConfigServices& services,
+                                               bool* passwordsWritten) const {
   auto notify = std::make_unique<TiXmlElement>("Notify");
   notify->SetAttribute("ID", static_cast<int>(core::kModuleId));
   AddCapabilityAttributes(*notify, m_attachmentsDisabled, m_smtpsAvailable);
@@ -268,13 +289,15 @@ std::unique_ptr<TiXmlElement> NotifyCfg::ToXml(const ConfigServices& services) c
   notify->SetAttribute("MaxRetryQueue", m_maxRetryQueue);
   notify->SetAttribute("EmailSizeLimitMB", m_emailSizeLimitMB);
   AppendElement(*notify, "Web")->SetAttribute("address", m_web.address);
-  WriteServers(*notify, services);
+  const bool written = WriteServers(*notify, services);
+  if (passwordsWritten != nullptr) *passwordsWritten = written;
   WriteProfiles(*notify);
   return notify;
 }
 
-void NotifyCfg::WriteServers(TiXmlElement& notify, const ConfigServices& services) const {
+bool NotifyCfg::WriteServers(TiXmlElement& notify, const ConfigServices& services) const {
   TiXmlElement* servers = AppendElement(notify, "Servers");
+  bool allWritten = true;
   for (const SmtpServer& server : m_servers) {
     TiXmlElement* smtp = AppendElement(*servers, "smtp");
     smtp->SetAttribute("description", server.description);
@@ -283,9 +306,10 @@ void NotifyCfg::WriteServers(TiXmlElement& notify, const ConfigServices& service
     smtp->SetAttribute("UseSSL", server.useSsl);
     if (!server.username.empty() || !server.password.empty() ||
         !server.unreadablePassword.empty()) {
-      WriteAuthentication(*smtp, server, services);
+      allWritten = WriteAuthentication(*smtp, server, services) && allWritten;
     }
   }
+  return allWritten;
 }
 
 void NotifyCfg::WriteProfiles(TiXmlElement& notify) const {
@@ -370,19 +394,35 @@ const NotifyProfile* NotifyCfg::FindProfile(int32_t id) const {
   return found != m_profiles.end() ? &found->second : nullptr;
 }
 
-void BuildConfigDocument(TiXmlDocument& document, const NotifyCfg& config,
+void NotifyCfg::RememberStoredPasswords(const TiXmlDocument& saved) {
+  const TiXmlElement* servers = ServersElement(saved);
+  const TiXmlElement* smtp = servers != nullptr ? servers->FirstChildElement("smtp") : nullptr;
+  // The document holds one "smtp" per server, in list order.
+  for (SmtpServer& server : m_servers) {
+    if (smtp == nullptr) return;
+    const TiXmlElement* authentication = smtp->FirstChildElement("Authentication");
+    const char* password =
+        authentication != nullptr ? authentication->Attribute("password") : nullptr;
+    if (password != nullptr && server.unreadablePassword.empty()) {
+      server.storedPassword = password;
+    }
+    smtp = smtp->NextSiblingElement("smtp");
+  }
+}
+
+bool BuildConfigDocument(TiXmlDocument& document, const NotifyCfg& config,
                          const ConfigServices& services) {
   document.LinkEndChild(new TiXmlDeclaration("", "", ""));
   auto* root = new TiXmlElement("Trellan");
   root->SetAttribute("Delta", 0);
   document.LinkEndChild(root);
-  root->LinkEndChild(config.ToXml(services).release());
+  bool passwordsWritten = true;
+  root->LinkEndChild(config.ToXml(services, &passwordsWritten).release());
+  return passwordsWritten;
 }
 
 bool RevealPasswords(TiXmlDocument& document, const ConfigServices& services) {
-  TiXmlElement* root = document.FirstChildElement();
-  TiXmlElement* notify = root != nullptr ? root->FirstChildElement("Notify") : nullptr;
-  TiXmlElement* servers = notify != nullptr ? notify->FirstChildElement("Servers") : nullptr;
+  auto* servers = const_cast<TiXmlElement*>(ServersElement(document));
   if (servers == nullptr) return true;
   bool allRead = true;
   for (TiXmlElement* smtp = servers->FirstChildElement("smtp"); smtp != nullptr;

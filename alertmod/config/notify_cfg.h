@@ -61,10 +61,18 @@ class NotifyCfg {
   bool Parse(const TiXmlDocument& document, const ConfigServices& services);
 
   // A new "Notify" element with the whole configuration and the capability
-  // attributes. Passwords are protected by the host and marked encrypt="algo";
-  // a password the host cannot protect is left out (the failure goes to the
-  // error sink). A password that could not be read is written back unchanged.
-  std::unique_ptr<TiXmlElement> ToXml(const ConfigServices& services) const;
+  // attributes. Passwords are protected by the host and marked encrypt="algo".
+  // A password the host cannot protect is written in the stored form known
+  // for it; without one it is left out and `*passwordsWritten` (when given)
+  // becomes false. A password that could not be read is written back
+  // unchanged. Every failure goes to the error sink.
+  std::unique_ptr<TiXmlElement> ToXml(const ConfigServices& services,
+                                      bool* passwordsWritten = nullptr) const;
+
+  // Records the protected passwords of `saved` as the stored forms of the
+  // servers' passwords. `saved` must have been built from this configuration
+  // (BuildConfigDocument) and be what notify.xml now holds.
+  void RememberStoredPasswords(const TiXmlDocument& saved);
 
   // Normalizes the web server address from its text; null clears it.
   void SetWebAddress(const char* text);
@@ -107,7 +115,7 @@ class NotifyCfg {
   void ReadProfiles(const TiXmlElement& profiles, const ConfigServices& services);
   bool ReadProfile(const TiXmlElement& smtp, int32_t& next, const ConfigServices& services,
                    NotifyProfile& profile) const;
-  void WriteServers(TiXmlElement& notify, const ConfigServices& services) const;
+  bool WriteServers(TiXmlElement& notify, const ConfigServices& services) const;
   void WriteProfiles(TiXmlElement& notify) const;
 
   int32_t m_nextProfileId = 1;
@@ -131,8 +139,10 @@ void ParseSmtpServers(const TiXmlElement& serversElement, std::vector<SmtpServer
                       const ConfigServices& services);
 
 // Fills an empty `document` with the declaration "<?xml ?>" and the root
-// "Trellan" (Delta 0) holding `config.ToXml(services)`.
-void BuildConfigDocument(TiXmlDocument& document, const NotifyCfg& config,
+// "Trellan" (Delta 0) holding `config.ToXml(services)`. Returns false when a
+// password could neither be protected nor written in a stored form: such a
+// document must not replace notify.xml, which would lose the password.
+bool BuildConfigDocument(TiXmlDocument& document, const NotifyCfg& config,
                          const ConfigServices& services);
 
 // Turns the protected passwords of a configuration document into clear text

@@ -619,19 +619,28 @@ TEST_F(NotifyCfgTest, NewPasswordReplacesAnUnreadableOne) {
   EXPECT_EQ(config.Servers()[0].unreadablePassword, "");
 }
 
-TEST_F(NotifyCfgTest, PasswordThatCannotBeProtectedIsLeftOut) {
-  NotifyCfg config;
-  ASSERT_TRUE(ParseNotify(config, "",
+TEST_F(NotifyCfgTest, PasswordThatCannotBeProtectedKeepsItsStoredForm) {
+  NotifyCfg typed;
+  ASSERT_TRUE(ParseNotify(typed, "",
                           "<Servers><smtp description='s' address='h'>"
                           "<Authentication username='u' password='Pa55word'/></smtp></Servers>"
                           "<Profiles/>"));
+  const std::string stored = Compact(typed);
+  NotifyCfg reread;
+  ASSERT_TRUE(ParseText(reread, stored));
   m_vault.FailProtection();
-  std::string stored = Compact(config);
-  EXPECT_EQ(stored.find("Pa55word"), std::string::npos);
-  EXPECT_NE(stored.find("<Authentication username=\"u\" />"), std::string::npos);
+  EXPECT_EQ(Compact(reread), stored);
   ASSERT_EQ(m_errors.size(), 2u);
   EXPECT_EQ(m_errors[0], "encryption error: -7");
-  EXPECT_NE(m_errors[1].find("could not be protected"), std::string::npos);
+  EXPECT_NE(m_errors[1].find("keeps the one stored before"), std::string::npos);
+
+  // Typed in and never stored: left out, and the document is not to be saved.
+  TiXmlDocument document;
+  EXPECT_FALSE(BuildConfigDocument(document, typed, m_services));
+  const std::string unsaved = PrintCompact(document);
+  EXPECT_EQ(unsaved.find("Pa55word"), std::string::npos);
+  EXPECT_NE(unsaved.find("<Authentication username=\"u\" />"), std::string::npos);
+  EXPECT_NE(m_errors.back().find("notify.xml is left unchanged"), std::string::npos);
 }
 
 }  // namespace

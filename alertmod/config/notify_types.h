@@ -25,6 +25,11 @@ struct SmtpServer {
   // password meanwhile, and the text is written back unchanged so that
   // nothing is lost. Empty normally.
   std::string unreadablePassword;
+  // The protected form of the password that notify.xml holds for this
+  // server, as read from it or last saved to it. A save during which the
+  // host cannot protect the password writes this instead, so that the file
+  // does not lose it. Empty when none is known.
+  std::string storedPassword;
 };
 
 struct NotifyProfile {

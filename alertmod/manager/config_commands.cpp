@@ -120,9 +120,13 @@ void NotifyManager::LoadConfig() {
 
 void NotifyManager::PostConfig() {
   TiXmlDocument document;
-  BuildConfigDocument(document, m_config, m_configServices);
+  // Without a password the host could not protect, the file is left as it
+  // is (the error sink has said so): it may hold that password.
+  const bool complete = BuildConfigDocument(document, m_config, m_configServices);
   std::string error;
-  if (!SaveXmlDurably(document, kConfigFileName, &error)) {
+  if (complete && SaveXmlDurably(document, kConfigFileName, &error)) {
+    m_config.RememberStoredPasswords(document);
+  } else if (complete) {
     LogToHost(core::kModuleId, m_callback, LogLevelError,
               "Unable to save the configuration to %s: %s", kConfigFileName, error.c_str());
   }
