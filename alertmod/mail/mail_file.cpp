@@ -1,5 +1,6 @@
 #include "alertmod/mail/mail_file.h"
 
+#include <algorithm>
 #include <ctime>
 #include <exception>
 #include <mutex>
@@ -15,7 +16,10 @@
 namespace hx {
 namespace {
 
+// SMTP knows no other line end (servers hardened against smuggling refuse a
+// bare LF), so every line the composer writes ends with it.
 constexpr char kCrLf[] = "\r\n";
+constexpr size_t kCrLfChars = sizeof(kCrLf) - 1;
 constexpr char kDateFormat[] = "%a, %d %b %Y %T %z (%Z)";
 constexpr char kImageType[] = "image/jpeg";
 constexpr char kVideoType[] = "video/quicktime";
@@ -39,6 +43,18 @@ std::string HeaderValue(std::string value) {
     if (c == '\r' || c == '\n') c = ' ';
   }
   return value;
+}
+
+// The body with every bare LF made CR LF; a CR LF stays as it is, so a body
+// typed either way keeps its lines. A line holding a single "." is left as it
+// is: the transfer tool doubles a leading dot, but only after a CR LF.
+std::string CrLfLines(const std::string& body) {
+  std::string lines;
+  for (size_t i = 0; i < body.size(); ++i) {
+    if (body[i] == '\n' && (i == 0 || body[i - 1] != '\r')) lines += '\r';
+    lines += body[i];
+  }
+  return lines;
 }
 
 std::string MailFileName(const NotifyWorkItem& item, uint32_t part, uint32_t total,
@@ -95,13 +111,13 @@ bool WriteHeader(const NotifyWorkItem& item, uint32_t part, uint32_t total,
 }
 
 // Encodes `length` bytes as lines of 57 bytes. A piece whose encoding needs
-// no padding ends with LF; a padded piece (only ever the last) ends without.
+// no padding ends with CR LF; a padded piece (only ever the last) ends without.
 size_t EncodeLines(const uint8_t* data, size_t length, char* out) {
   char* start = out;
   for (size_t offset = 0; offset < length; offset += kLineBytes) {
     size_t piece = length - offset < kLineBytes ? length - offset : kLineBytes;
     out += Base64EncodeTo(data + offset, piece, out);
-    if (piece % 3 == 0) *out++ = '\n';
+    if (piece % 3 == 0) out = std::copy(kCrLf, kCrLf + kCrLfChars, out);
   }
   return static_cast<size_t>(out - start);
 }
@@ -111,7 +127,7 @@ void WriteBase64File(const std::string& path, INotifyFileStream& stream) {
   if (!file.IsGood()) return;
   std::vector<uint8_t> input(kLineBytes * kLinesPerBlock);
   std::string output;
-  const size_t outputCapacity = (kLineChars + 1) * kLinesPerBlock;
+  const size_t outputCapacity = (kLineChars + kCrLfChars) * kLinesPerBlock;
   while (file.IsGood() && stream.IsGood()) {
     size_t got = file.Read(input.data(), input.size());
     if (got == 0) break;
@@ -156,10 +172,10 @@ void WriteMultipartBody(const NotifyWorkItem& item, const std::vector<MailAttach
       .WriteText(kCrLf);
   stream.WriteText(kCrLf).WriteText("--").WriteText(kMailBoundary).WriteText(kCrLf);
   stream.WriteText("Content-Type: text/plain").WriteText(kCrLf).WriteText(kCrLf);
-  stream.WriteString(item.profile.body);
+  stream.WriteString(CrLfLines(item.profile.body));
   for (const MailAttachment& attachment : attachments) {
     if (!attachment.description.empty())
-      stream.WriteText("\n- ").WriteString(attachment.description);
+      stream.WriteText(kCrLf).WriteText("- ").WriteString(attachment.description);
   }
   for (const MailAttachment& attachment : attachments) {
     if (attachment.include) WriteAttachmentPart(attachment, stream);
@@ -203,7 +219,7 @@ bool ComposeMailFile(const NotifyWorkItem& item, const std::vector<MailAttachmen
   if (!stream.Open(mail.path, std::ios_base::binary | std::ios_base::trunc)) return false;
   bool addressed = WriteHeader(item, part, total, stream, mail);
   if (addressed && attachments.empty()) {
-    stream.WriteText(kCrLf).WriteString(item.profile.body);
+    stream.WriteText(kCrLf).WriteString(CrLfLines(item.profile.body));
   } else if (addressed) {
     WriteMultipartBody(item, attachments, stream);
   }

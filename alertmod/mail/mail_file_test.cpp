@@ -71,7 +71,7 @@ std::string ElideAttachments(const std::string& text) {
     }
     result.append(text, copied, begin - copied);
     if (lines.size() > 2) {
-      lines[1] = "[" + std::to_string(lines.size() - 2) + " lines]\n" + lines.back();
+      lines[1] = "[" + std::to_string(lines.size() - 2) + " lines]\r\n" + lines.back();
       lines.resize(2);
     }
     for (const std::string& line : lines) result += line;
@@ -176,7 +176,7 @@ TEST_F(MailFileTest, PlainMessage) {
   EXPECT_EQ(MimeCheck(m_mail.path, {}),
             std::string(kHeaderCheck) +
                 "header Subject: Motion on Lobby\n"
-                "text text/plain Motion was detected.\\r\\nSecond line.\\n\n");
+                "text text/plain Motion was detected.\\r\\nSecond line.\\r\\n\n");
 }
 
 TEST_F(MailFileTest, OneJpeg) {
@@ -188,7 +188,7 @@ TEST_F(MailFileTest, OneJpeg) {
                 "header Subject: Motion on Lobby\n"
                 "header Content-Type: multipart/mixed; "
                 "boundary=\"b1914efc629febb89915e8a6f83ba6eb\"\n"
-                "text text/plain Motion was detected.\\r\\nSecond line.\\n\n"
+                "text text/plain Motion was detected.\\r\\nSecond line.\\r\\n\n"
                 "part image/jpeg Lobby.jpg base64 200 SAME\n");
 }
 
@@ -203,8 +203,8 @@ TEST_F(MailFileTest, FailedAttachmentIsDescribedInTheBody) {
                 "header Subject: Motion on Lobby\n"
                 "header Content-Type: multipart/mixed; "
                 "boundary=\"b1914efc629febb89915e8a6f83ba6eb\"\n"
-                "text text/plain Motion was detected.\\r\\nSecond line.\\n\\n- Failed to prepare "
-                "video attachment for source: \"Door\", \n"
+                "text text/plain Motion was detected.\\r\\nSecond line.\\r\\n\\r\\n- Failed to "
+                "prepare video attachment for source: \"Door\", \n"
                 "part video/quicktime Yard.mp4 base64 300 SAME\n"
                 "part video/quicktime gone.mov base64 0 SAME\n");
 }
@@ -234,7 +234,7 @@ TEST_F(MailFileTest, SplitsBySizeLimit) {
                   std::to_string(part) + " of 2\n" +
                   "header Content-Type: multipart/mixed; "
                   "boundary=\"b1914efc629febb89915e8a6f83ba6eb\"\n"
-                  "text text/plain Motion was detected.\\r\\nSecond line.\\n\n" +
+                  "text text/plain Motion was detected.\\r\\nSecond line.\\r\\n\n" +
                   expected[part - 1]);
   }
 }
@@ -248,12 +248,12 @@ TEST_F(MailFileTest, Base64Pieces) {
   };
   const Case cases[] = {
       {0, ""},
-      {3, "QUFB\n"},
+      {3, "QUFB\r\n"},
       {56, full.substr(0, 72) + "QUE="},
-      {57, full + "\n"},
-      {58, full + "\nQQ=="},
-      {114, full + "\n" + full + "\n"},
-      {115, full + "\n" + full + "\nQQ=="},
+      {57, full + "\r\n"},
+      {58, full + "\r\nQQ=="},
+      {114, full + "\r\n" + full + "\r\n"},
+      {115, full + "\r\n" + full + "\r\nQQ=="},
   };
   for (const Case& c : cases) {
     std::string content = Compose(Item(), {Attachment("a.jpg", std::string(c.bytes, 'A'))});
@@ -286,8 +286,9 @@ TEST_F(MailFileTest, AddressLines) {
     item.profile.cc = c.cc;
     item.profile.bcc.clear();
     std::string content = Compose(item, {});
-    EXPECT_EQ(content, "From: desk@example.com\r\n" + c.lines + "Subject: Motion on Lobby\r\n\r\n" +
-                           item.profile.body);
+    EXPECT_EQ(content,
+              "From: desk@example.com\r\n" + c.lines +
+                  "Subject: Motion on Lobby\r\n\r\nMotion was detected.\r\nSecond line.\r\n");
   }
 }
 

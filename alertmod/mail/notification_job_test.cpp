@@ -152,8 +152,8 @@ TEST_F(NotificationJobTest, UnpreparedAttachmentLeavesALineInTheBody) {
   Run();
   ASSERT_EQ(m_helper.runs.size(), 1u);
   EXPECT_NE(m_helper.messages[0].find(
-                "Look\n- Failed to prepare video attachment for source: \"Empty\", "
-                "\n- Failed to prepare video attachment for source: \"Broken\", \r\n--"),
+                "Look\r\n- Failed to prepare video attachment for source: \"Empty\", "
+                "\r\n- Failed to prepare video attachment for source: \"Broken\", \r\n--"),
             std::string::npos)
       << m_helper.messages[0];
   EXPECT_EQ(m_helper.messages[0].find("Content-Disposition"), std::string::npos);

@@ -59,12 +59,6 @@ class Store:
         return "250 OK"
 
 
-class LenientSMTP(SMTP):
-    # Message files carry base64 lines ended by a bare LF, which SMTP sees as
-    # one long line; accept them as a lenient real server does.
-    line_length_limit = 1 << 30
-
-
 def make_authenticator(user, password):
     def authenticate(server, session, envelope, mechanism, auth_data):
         if isinstance(auth_data, LoginPassword) and auth_data.login == user.encode() \
@@ -89,7 +83,7 @@ def factory(args, handler):
         options["authenticator"] = make_authenticator(args.user, args.password)
         options["auth_required"] = True
         options["auth_require_tls"] = False
-    return lambda: LenientSMTP(handler, **options)
+    return lambda: SMTP(handler, **options)
 
 
 async def main(args):
