@@ -14,6 +14,7 @@
 #include <dirent.h>
 #include <signal.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <atomic>
 #include <cerrno>
@@ -281,9 +282,18 @@ TEST_F(FaultInjectionTest, FullDiskDiscardsFailuresInsteadOfQueueingThem) {
   ASSERT_TRUE(WaitForStatus(1, 1));
   ASSERT_EQ(MessageFiles().size(), 1u);
 
+  // The volume fills up while the next message is written (it takes the next
+  // sequence number): nothing of it stays behind.
+  ASSERT_EQ(symlink("/dev/full", "data/notify-mail-3-0-0-1"), 0);
+  PlainAlarm();
+  ASSERT_TRUE(WaitForStatus(1, 2));
+  EXPECT_TRUE(host().Log().Contains(
+      "Failed to prepare email notification file. (Profile Description: Front door)"));
+  EXPECT_EQ(MessageFiles().size(), 1u) << "the message cut short is removed";
+
   g_freeBytes = 0;
   AlarmWithVideo();
-  ASSERT_TRUE(WaitForStatus(1, 2));
+  ASSERT_TRUE(WaitForStatus(1, 3));
   EXPECT_TRUE(
       host().Log().Contains("Available bytes 0 are less than threshold of 104857600. "
                             "Attempting to purge failed notifications"));
@@ -296,7 +306,7 @@ TEST_F(FaultInjectionTest, FullDiskDiscardsFailuresInsteadOfQueueingThem) {
   g_freeBytes = uint64_t{1} << 40;
   g_freeBytesQueryFails = true;
   PlainAlarm();
-  ASSERT_TRUE(WaitForStatus(1, 3));
+  ASSERT_TRUE(WaitForStatus(1, 4));
   EXPECT_TRUE(host().Log().Contains("Exception while query volume space: "));
   EXPECT_EQ(MessageFiles().size(), 2u);
 

@@ -117,6 +117,9 @@ bool SendMessage(NotifyWorkItem& item, const std::vector<MailAttachment>& attach
   MailFile mail;
   RetryQueue& retries = helper.Retries();
   if (!ComposeMailFile(item, attachments, part, total, retries.Sequence(), stream, mail)) {
+    // A message that could not be written whole (a full volume) is never
+    // sent; its file would only take space until the next start.
+    stream.RemoveFile(mail.path);
     LogToHost(core::kModuleId, helper.Callback(), LogLevelError,
               "Failed to prepare email notification file. (Profile Description: %s)",
               item.profile.description.c_str());

@@ -39,8 +39,9 @@ class IAttachmentWriter {
 std::unique_ptr<IAttachmentWriter> MakeAttachmentWriter(core::HostCallbackFn callback);
 
 // Runs the whole job for `item`. Failures are logged and reported to the host
-// as status 1; nothing is thrown for expected failures. `maxRetryQueue` bounds
-// the retry queue when a message has to wait.
+// as status 1; nothing is thrown for expected failures. A message file that
+// could not be composed whole is removed. `maxRetryQueue` bounds the retry
+// queue when a message has to wait.
 void RunNotificationJob(NotifyWorkItem& item, NotifyHelper& helper, INotifyFileStream& stream,
                         int32_t maxRetryQueue, IAttachmentWriter& writer);
 
