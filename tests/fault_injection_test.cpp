@@ -19,6 +19,7 @@
 #include <atomic>
 #include <cerrno>
 #include <chrono>
+#include <cstdlib>
 #include <cstring>
 #include <functional>
 #include <memory>
@@ -58,7 +59,8 @@ std::string NotifyFile(int port) {
          "<to>guard@example.com</to><body>Door opened.</body></smtp>"
          "<smtp ID=\"4\" attach=\"1\" description=\"Lobby camera\" ThrottleSeconds=\"0\" "
          "from=\"desk@example.com\" subject=\"Motion\" MaxVideoSeconds=\"0\" EventEdge=\"0\">"
-         "<to>guard@example.com</to><body>Motion in the lobby.</body></smtp>"
+         "<to>guard@example.com</to><body>Motion in the lobby.&#x0A;.&#x0A;Look at the "
+         "still.</body></smtp>"
          "</Profiles></Notify></Trellan>";
 }
 
@@ -120,10 +122,11 @@ class FaultInjectionTest : public managertest::ManagerHostTest {
     SendSystem(system);
   }
 
-  // A camera alarm for the video profile after some JPEG frames, and one for
-  // the plain profile.
-  void AlarmWithVideo() {
-    PushFrames(kCameraStream, 5, 1, 40, 3000);
+  // A camera alarm for the video profile after some JPEG frames of
+  // `frameBytes` (a 32-byte header, then the still), and one for the plain
+  // profile.
+  void AlarmWithVideo(uint32_t frameBytes = 3000) {
+    PushFrames(kCameraStream, 5, 1, 40, frameBytes);
     refhost::AlarmDocument alarm;
     refhost::AlarmRequest request;
     request.profile = kVideoProfile;
@@ -156,6 +159,18 @@ class FaultInjectionTest : public managertest::ManagerHostTest {
       closedir(d);
     }
     return names;
+  }
+
+  // Python's email package's reading of the message file `name`: the
+  // listing of mail_parts.py, which writes the text part and the attachments
+  // into the directory `name`.parts.
+  std::string MailParts(const std::string& name) {
+    const std::string parts = dir().File(name + ".parts");
+    mkdir(parts.c_str(), 0755);
+    const std::string command = "/usr/bin/python3 " ALERTMOD_TEST_SUPPORT_DIR "/mail_parts.py '" +
+                                dir().File(name) + "' '" + parts + "' >'" + parts + "/listing'";
+    EXPECT_EQ(system(command.c_str()), 0) << command;
+    return testsupport::ReadFile(parts + "/listing");
   }
 
   // Waits until `done` holds, looking every few milliseconds: what it reads
@@ -314,6 +329,29 @@ TEST_F(FaultInjectionTest, FullDiskDiscardsFailuresInsteadOfQueueingThem) {
   ASSERT_TRUE(AdvanceUntil(30s, [&] { return smtp.Messages().size() >= 2; }));
   ASSERT_TRUE(WaitForStatus(0, 2));
   EXPECT_TRUE(PollUntil([&] { return MessageFiles().empty(); }, 10s));
+  ExpectNothingLeftBehind();
+}
+
+// A mail server hardened against SMTP smuggling takes nothing but CR LF as a
+// line end. Postfix so configured relays a message with a 1 MiB still and a
+// body typed with LF line breaks, one line holding a single dot, and what
+// arrives reads as what the module composed.
+TEST_F(FaultInjectionTest, MailServerRefusingBareLineFeeds) {
+  SmtpTestServer smtp;
+  testsupport::PostfixRelay postfix(smtp.port());
+  const std::string sent = dir().File("sent.eml");
+  Start(postfix.port(),
+        ToolScript("for a; do [ \"$p\" = -T ] && cp \"$a\" '" + sent + "'; p=$a; done"));
+  AlarmWithVideo(32 + 1048576);
+  ASSERT_TRUE(smtp.WaitForMessages(1));
+  ASSERT_TRUE(testsupport::WriteFile(dir().File("received.eml"), smtp.Messages()[0].data));
+  const std::string listing = MailParts("received.eml");
+  EXPECT_EQ(listing, "subject Motion\nattachment Lobby.jpg image/jpeg 1048576\n");
+  EXPECT_EQ(listing, MailParts("sent.eml"));
+  EXPECT_EQ(testsupport::ReadFile(dir().File("received.eml.parts/body.txt")),
+            "Motion in the lobby.\n.\nLook at the still.");
+  EXPECT_TRUE(testsupport::ReadFile(dir().File("received.eml.parts/Lobby.jpg")) ==
+              testsupport::ReadFile(dir().File("sent.eml.parts/Lobby.jpg")));
   ExpectNothingLeftBehind();
 }
 

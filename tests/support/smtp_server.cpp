@@ -21,6 +21,8 @@ namespace testsupport {
 namespace {
 
 constexpr char kPython[] = "/usr/bin/python3";
+constexpr char kPostfix[] = "/usr/sbin/postfix";
+constexpr char kPostfixRelayScript[] = ALERTMOD_TEST_SUPPORT_DIR "/postfix_relay.sh";
 
 // Starts `argv` with its standard output on a pipe; the child dies with us.
 pid_t Spawn(const std::vector<std::string>& args, int* stdoutFd) {
@@ -151,6 +153,18 @@ int SmtpTestServer::FreePort() {
   }
   close(fd);
   return port;
+}
+
+PostfixRelay::PostfixRelay(int relayPort) : m_port(SmtpTestServer::FreePort()) {
+  EXPECT_EQ(access(kPostfix, X_OK), 0) << kPostfix << " is needed (Debian package postfix)";
+  std::string command = std::string(kPostfixRelayScript) + " start '" + m_dir.path() + "' " +
+                        std::to_string(m_port) + " " + std::to_string(relayPort);
+  EXPECT_EQ(system(command.c_str()), 0) << "Postfix did not start: " << command;
+}
+
+PostfixRelay::~PostfixRelay() {
+  // Fails harmlessly when Postfix never started, which the constructor reported.
+  system((std::string(kPostfixRelayScript) + " stop '" + m_dir.path() + "'").c_str());
 }
 
 bool MakeSelfSignedCertificate(const std::string& dir, std::string* cert, std::string* key) {

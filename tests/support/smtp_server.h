@@ -68,6 +68,25 @@ class SmtpTestServer {
   pid_t m_pid = -1;
 };
 
+// A real Postfix hardened against SMTP smuggling (a line not ended by CR LF
+// is refused), started as a private instance under a temporary directory on
+// a free port of 127.0.0.1, relaying every message it accepts to
+// 127.0.0.1:`relayPort`. Needs root and Debian's postfix; fails the test
+// loudly without them. Stopped when destroyed, also after a failure.
+class PostfixRelay {
+ public:
+  explicit PostfixRelay(int relayPort);
+  ~PostfixRelay();
+  PostfixRelay(const PostfixRelay&) = delete;
+  PostfixRelay& operator=(const PostfixRelay&) = delete;
+
+  int port() const { return m_port; }
+
+ private:
+  TempDir m_dir;
+  int m_port = 0;
+};
+
 // Makes a self-signed certificate for 127.0.0.1 with the openssl command in
 // `dir`. False when openssl fails.
 bool MakeSelfSignedCertificate(const std::string& dir, std::string* cert, std::string* key);
