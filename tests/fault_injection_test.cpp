@@ -47,6 +47,7 @@ constexpr int32_t kVideoProfile = 4;
 constexpr int32_t kEncoders = 0x10000;
 constexpr int32_t kCameraEvent = 7;
 const uint32_t kCameraStream = refhost::HostStreamId(kEncoders, 1, 0, 0);
+constexpr uint32_t kFrameHeaderBytes = 32;  // before the still in a pushed frame
 
 std::string NotifyFile(int port) {
   return "<?xml ?><Trellan Delta=\"0\"><Notify ID=\"786432\" MaxRetrySeconds=\"172800\" "
@@ -122,11 +123,10 @@ class FaultInjectionTest : public managertest::ManagerHostTest {
     SendSystem(system);
   }
 
-  // A camera alarm for the video profile after some JPEG frames of
-  // `frameBytes` (a 32-byte header, then the still), and one for the plain
-  // profile.
-  void AlarmWithVideo(uint32_t frameBytes = 3000) {
-    PushFrames(kCameraStream, 5, 1, 40, frameBytes);
+  // A camera alarm for the video profile after some JPEG frames holding
+  // stills of `stillBytes`, and one for the plain profile.
+  void AlarmWithVideo(uint32_t stillBytes = 3000 - kFrameHeaderBytes) {
+    PushFrames(kCameraStream, 5, 1, 40, kFrameHeaderBytes + stillBytes);
     refhost::AlarmDocument alarm;
     refhost::AlarmRequest request;
     request.profile = kVideoProfile;
@@ -342,11 +342,13 @@ TEST_F(FaultInjectionTest, MailServerRefusingBareLineFeeds) {
   const std::string sent = dir().File("sent.eml");
   Start(postfix.port(),
         ToolScript("for a; do [ \"$p\" = -T ] && cp \"$a\" '" + sent + "'; p=$a; done"));
-  AlarmWithVideo(32 + 1048576);
+  constexpr uint32_t kStillBytes = 1048576;
+  AlarmWithVideo(kStillBytes);
   ASSERT_TRUE(smtp.WaitForMessages(1));
   ASSERT_TRUE(testsupport::WriteFile(dir().File("received.eml"), smtp.Messages()[0].data));
   const std::string listing = MailParts("received.eml");
-  EXPECT_EQ(listing, "subject Motion\nattachment Lobby.jpg image/jpeg 1048576\n");
+  EXPECT_EQ(listing, "subject Motion\nattachment Lobby.jpg image/jpeg " +
+                         std::to_string(kStillBytes) + "\n");
   EXPECT_EQ(listing, MailParts("sent.eml"));
   EXPECT_EQ(testsupport::ReadFile(dir().File("received.eml.parts/body.txt")),
             "Motion in the lobby.\n.\nLook at the still.");

@@ -58,8 +58,9 @@ struct PreparedAttachment {
 // (templates already expanded). `attachments` empty gives a plain message;
 // otherwise a multipart one whose text lists every non-empty description and
 // which carries every included file in base64. Every line ends with CR LF:
-// a bare LF of the body becomes CR LF, a CR LF there stays as it is. `part` is 1-based, or 0 when
-// the notification is not split; `total` is the number of parts.
+// a bare LF of the body becomes CR LF, a CR LF there stays as it is. `part`
+// is 1-based, or 0 when the notification is not split; `total` is the number
+// of parts.
 // Returns false when the file cannot be created, when the From text or any
 // To, Cc or Bcc text holds no address (the partly written file stays), or
 // when any write, including the final flush, failed. The stream is closed
