@@ -1,9 +1,9 @@
 // Faults around delivery, through the reference host with the testing module,
 // the real curl and a real SMTP server, with a camera whose frames the
 // notifications capture: the SMTP server away for a while, the transfer tool
-// missing, a host that refuses process messages, a full disk, configuration
-// updates while a slow delivery runs, and Close in the middle of a delivery
-// that does not end by itself.
+// missing, a host that refuses process messages, a full disk, a mail server
+// that refuses bare line feeds, configuration updates while a slow delivery
+// runs, and Close in the middle of a delivery that does not end by itself.
 //
 // Whatever happens, the module keeps what its design keeps (failed messages
 // queued for retry and delivered later), gives every notification a status,
