@@ -75,7 +75,7 @@ def tls_context(cert, key):
 
 
 def factory(args, handler):
-    options = {"hostname": "alertmod-test", "data_size_limit": 0}
+    options = {"hostname": "alertmod-test"}
     if args.mode == "starttls":
         options["tls_context"] = tls_context(args.cert, args.key)
         options["require_starttls"] = True
