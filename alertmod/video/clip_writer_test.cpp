@@ -5,6 +5,7 @@
 #include <string>
 
 #include "alertmod/diag/log.h"
+#include "alertmod/platform/clock.h"
 #include "alertmod/video/testing/clip_media.h"
 #include "tests/support/fake_host.h"
 #include "tests/support/temp_dir.h"
@@ -73,9 +74,12 @@ TEST_F(ClipWriterTest, ClipsPlayBackWithTheirStreamDescription) {
       {{kCodecH265, 1920, 1080, 50, 25}, ".mp4", "hevc"},
       {{kCodecH265, 1280, 720, 50, 25}, ".mp4", "hevc"},
       {{kCodecMpeg4, 1280, 720, 50, 25}, ".mov", "mpeg4"},
+      {{kCodecH264, 1280, 720, 50, 25, 2}, ".mov", "h264"},
+      {{kCodecH265, 1280, 720, 50, 25, 3}, ".mp4", "hevc"},
   };
   for (const Case& c : cases) {
-    const std::string name = std::string(c.codecName) + std::to_string(c.recipe.height);
+    const std::string name = std::string(c.codecName) + std::to_string(c.recipe.height) + "b" +
+                             std::to_string(c.recipe.bframes);
     SCOPED_TRACE(name);
     const std::vector<MediaFrame> frames = Frames(c.recipe);
     ASSERT_FALSE(frames.empty());
@@ -99,6 +103,10 @@ TEST_F(ClipWriterTest, ClipsPlayBackWithTheirStreamDescription) {
     EXPECT_EQ(probe.count("TAG:language") ? probe.at("TAG:language") : "", "eng");
     EXPECT_FALSE(probe.count("TAG:creation_time") == 0 || probe.at("TAG:creation_time").empty());
     EXPECT_EQ(cliptest::DecodeErrors(path), "");
+    // Shown in display order, B-frames included.
+    const std::vector<int64_t> shown = cliptest::FramePresentationTimes(path);
+    EXPECT_EQ(shown.size(), frames.size());
+    for (size_t i = 1; i < shown.size(); ++i) ASSERT_LT(shown[i - 1], shown[i]) << i;
 
     const std::vector<uint8_t> file = cliptest::ReadBytes(path);
     const std::vector<uint8_t> moov = cliptest::MoovBox(file);
@@ -217,18 +225,29 @@ TEST_F(ClipWriterTest, FilesThatCannotBeStartedAreLogged) {
   EXPECT_EQ(lines, 4u);
 }
 
-TEST_F(ClipWriterTest, ClipsTooLongForTheReservedHeaderLeaveNoBrokenFile) {
-  // Many short groups of pictures outgrow the 16352 bytes kept for the
-  // movie header; the container then cannot be finished.
-  const MediaRecipe recipe{kCodecH264, 64, 64, 3600, 2};
-  const std::vector<MediaFrame> frames = Frames(recipe);
-  ASSERT_EQ(frames.size(), 3600u);
-  HostClip clip(recipe, frames, kHostHeader, 100, 33);
-  const std::string path = m_dir.File("long.mov");
-  EXPECT_TRUE(WriteVideoAttachment(5, clip.Stream(), path, m_host.callback()));
-  EXPECT_FALSE(testsupport::FileExists(path));
-  EXPECT_TRUE(Logged(core::kClipWriterLogSource, LogLevelError,
-                     "failed to finish mp4/mov file for 5: -22"));
+TEST_F(ClipWriterTest, LongClipsKeepEveryFrame) {
+  // 30 frames and one key frame a second, few bytes a frame. The movie
+  // header of 10 s fits the 16352 bytes always reserved for it, and its file
+  // stays as it always was; that of 3 minutes needs more.
+  struct Case {
+    uint32_t seconds;
+    const char* sha256;  // null: any content
+  };
+  const Case cases[] = {{10, "933ca41a31b1bebf0fbe946e6fc47f96ef58fe93add8871a826243800ed2874c"}, {180, nullptr}};
+  platform::SetWallSource([](void*) -> int64_t { return 1700000000; }, nullptr);
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.seconds);
+    const MediaRecipe recipe{kCodecH264, 64, 64, c.seconds * 30, 30};
+    HostClip clip(recipe, Frames(recipe), kHostHeader, 100, 33);
+    const std::string path = m_dir.File("long.mov");
+    EXPECT_TRUE(WriteVideoAttachment(5, clip.Stream(), path, m_host.callback()));
+    EXPECT_EQ(cliptest::Probe(path)["nb_read_packets"], std::to_string(recipe.frames));
+    EXPECT_EQ(cliptest::DecodeErrors(path), "");
+    if (c.sha256 != nullptr) {
+      EXPECT_EQ(cliptest::RunCommand("sha256sum '" + path + "'", nullptr).substr(0, 64), c.sha256);
+    }
+  }
+  platform::SetWallSource(nullptr, nullptr);
 }
 
 TEST_F(ClipWriterTest, JpegStillIsThePayloadOfTheFirstFrame) {

@@ -79,14 +79,16 @@ std::vector<MediaFrame> SplitAtPictures(const std::vector<uint8_t>& stream) {
 
 std::string EncoderArguments(const MediaRecipe& recipe) {
   const std::string gop = std::to_string(recipe.gop);
+  const std::string bframes = std::to_string(recipe.bframes);
   switch (recipe.codec) {
     case hx::kCodecH265:
       return "-c:v libx265 -preset ultrafast -x265-params aud=1:keyint=" + gop +
-             ":min-keyint=" + gop + ":bframes=0:log-level=error -f hevc";
+             ":min-keyint=" + gop + ":bframes=" + bframes + ":log-level=error -f hevc";
     case hx::kCodecMpeg4:
       return "-c:v mpeg4 -g " + gop + " -bf 0 -q:v 5 -f m4v";
     default:
-      return "-c:v libx264 -preset ultrafast -g " + gop + " -bf 0 -x264-params aud=1 -f h264";
+      return "-c:v libx264 -preset ultrafast -g " + gop + " -bf " + bframes +
+             " -x264-params aud=1 -f h264";
   }
 }
 
@@ -184,6 +186,20 @@ std::map<std::string, std::string> Probe(const std::string& path) {
     if (equals != std::string::npos) values[line.substr(0, equals)] = line.substr(equals + 1);
   }
   return values;
+}
+
+std::vector<int64_t> FramePresentationTimes(const std::string& path) {
+  std::istringstream lines(RunCommand(
+      "ffprobe -v error -select_streams v:0 -show_entries frame=pts -of csv=p=0 '" + path + "'",
+      nullptr));
+  std::vector<int64_t> times;
+  std::string line;
+  while (std::getline(lines, line)) {
+    char* end = nullptr;
+    const long long pts = strtoll(line.c_str(), &end, 10);
+    if (end != line.c_str()) times.push_back(pts);  // "N/A" and messages are left out
+  }
+  return times;
 }
 
 std::string DecodeErrors(const std::string& path) {

@@ -30,6 +30,7 @@ struct MediaRecipe {
   uint32_t height = 720;
   uint32_t frames = 25;
   uint32_t gop = 25;
+  uint32_t bframes = 0;  // B-frames between references (H.264, H.265)
 };
 
 // Runs `command` through the shell; returns its standard output and error.
@@ -75,6 +76,10 @@ class HostClip {
 // "nb_read_packets", "codec_tag_string", "r_frame_rate", "TAG:language" of
 // the video stream and "TAG:creation_time" of the file.
 std::map<std::string, std::string> Probe(const std::string& path);
+
+// Presentation times of the video frames in the order the decoder returns
+// them; empty when the file cannot be read.
+std::vector<int64_t> FramePresentationTimes(const std::string& path);
 
 // What `ffmpeg -v error` prints while decoding the whole file.
 std::string DecodeErrors(const std::string& path);
