@@ -118,6 +118,9 @@ void AVCodecLib::Resolve() {
   ok &= AV_BIND(avcodec_free_context);
   ok &= AV_BIND(avcodec_decode_subtitle2);
   ok &= AV_BIND(avsubtitle_free);
+  ok &= AV_BIND(av_parser_init);
+  ok &= AV_BIND(av_parser_parse2);
+  ok &= AV_BIND(av_parser_close);
   m_resolved = ok && HasModule();
 }
 

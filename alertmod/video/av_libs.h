@@ -120,6 +120,9 @@ class AVCodecLib : public LibWrapper {
   decltype(&::avcodec_free_context) avcodec_free_context = nullptr;
   decltype(&::avcodec_decode_subtitle2) avcodec_decode_subtitle2 = nullptr;
   decltype(&::avsubtitle_free) avsubtitle_free = nullptr;
+  decltype(&::av_parser_init) av_parser_init = nullptr;
+  decltype(&::av_parser_parse2) av_parser_parse2 = nullptr;
+  decltype(&::av_parser_close) av_parser_close = nullptr;
 
  private:
   bool m_resolved = false;

@@ -55,6 +55,19 @@ int64_t ClipTimeMs(uint32_t firstMs, uint32_t arrivalMs) {
   return base + static_cast<uint32_t>(arrivalMs - firstMs);
 }
 
+// The most that FeedFrames will offer.
+PSStreamExtent ClipExtent(const CVideoEmailStream& stream) {
+  PSStreamExtent extent;
+  for (const Gop& gop : stream.Gops()) {
+    for (const VideoFrame& frame : gop.frames) {
+      ++extent.frames;
+      if (frame.frameType == kKeyFrameType) ++extent.keyFrames;
+      extent.bytes += PayloadOf(frame).size;
+    }
+  }
+  return extent;
+}
+
 void FeedFrames(const CVideoEmailStream& stream, videomake::CStreamInfo* info) {
   const uint32_t firstMs = stream.FirstFrameMs();
   for (const Gop& gop : stream.Gops()) {
@@ -84,6 +97,7 @@ bool WriteVideoAttachment(uint32_t streamId, const CVideoEmailStream& stream,
     const uint32_t spanMs = lastMs != firstMs ? lastMs - firstMs : 1;
     videomake::CStreamInfo info(streamId, packetCodec, stream.Width(), stream.Height(),
                                 ClipFps(stream, spanMs), path.c_str(), spanMs, callback, libs);
+    info.SetExtent(ClipExtent(stream));
     FeedFrames(stream, &info);
     info.Close();
     return true;

@@ -233,7 +233,8 @@ TEST_F(ClipWriterTest, LongClipsKeepEveryFrame) {
     uint32_t seconds;
     const char* sha256;  // null: any content
   };
-  const Case cases[] = {{10, "933ca41a31b1bebf0fbe946e6fc47f96ef58fe93add8871a826243800ed2874c"}, {180, nullptr}};
+  const Case cases[] = {{10, "933ca41a31b1bebf0fbe946e6fc47f96ef58fe93add8871a826243800ed2874c"},
+                        {180, nullptr}};
   platform::SetWallSource([](void*) -> int64_t { return 1700000000; }, nullptr);
   for (const Case& c : cases) {
     SCOPED_TRACE(c.seconds);

@@ -1,11 +1,15 @@
 #include "alertmod/video/ps_convert_stream.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
+#include <numeric>
 
 #include "alertmod/platform/clock.h"
 #include "alertmod/platform/utc_time.h"
+#include "alertmod/video/movie_header.h"
 
 namespace hx {
 namespace {
@@ -19,6 +23,10 @@ constexpr uint32_t kZeroSizeUnitsPixels = 4096;
 constexpr AVRational kStreamTimeBase{1, 90000};
 constexpr AVRational kMilliseconds{1, 1000};
 constexpr int kFrameRatePrecision = 100000;
+constexpr const char* kMovieHeaderOption = "moov_size";
+// The H.264 and H.265 framing written in place of start codes never takes
+// more than twice the bytes of the stream as received.
+constexpr uint64_t kStoredBytesPerPayloadByte = 2;
 
 struct CodecEntry {
   uint8_t codec;
@@ -58,6 +66,23 @@ uint32_t PixelsFromUnits(uint8_t units) {
 
 bool IsIsoMediaFormat(const AVOutputFormat* format) {
   return strcmp(format->name, "mov") == 0 || strcmp(format->name, "mp4") == 0;
+}
+
+// Each frame's rank in display order. Frames without a known picture order
+// keep the group in decoding order.
+template <typename Frame>
+std::vector<int64_t> DisplayRanks(const std::vector<Frame>& gop, int unknown) {
+  std::vector<size_t> byOrder(gop.size());
+  std::iota(byOrder.begin(), byOrder.end(), 0);
+  const bool known = std::none_of(gop.begin(), gop.end(),
+                                  [unknown](const Frame& frame) { return frame.order == unknown; });
+  if (known) {
+    std::stable_sort(byOrder.begin(), byOrder.end(),
+                     [&gop](size_t a, size_t b) { return gop[a].order < gop[b].order; });
+  }
+  std::vector<int64_t> ranks(gop.size());
+  for (size_t rank = 0; rank < byOrder.size(); ++rank) ranks[byOrder[rank]] = rank;
+  return ranks;
 }
 
 }  // namespace
@@ -177,7 +202,17 @@ bool PSConvertAVCodecStream::CreateStream(const IPSConvertStreamInfo& info, uint
   slot.stream = stream;
   slot.codec = descriptor.codec;
   slot.configured = !IsNalCodec(descriptor.codec) && descriptor.codec != kPSCodecMpeg4;
+  slot.extentKnown = info.GetStreamExtent(index, &slot.extent);
+  if (IsNalCodec(descriptor.codec)) CreateParser(&slot, id);
   return true;
+}
+
+void PSConvertAVCodecStream::CreateParser(StreamSlot* slot, AVCodecID id) {
+  // Without a parser the frames keep their decoding order, as a stream
+  // without B-frames needs.
+  slot->parser = m_libs.av_parser_init(id);
+  slot->parserCodec = m_libs.avcodec_alloc_context3(nullptr);
+  if (slot->parser != nullptr) slot->parser->flags |= PARSER_FLAG_COMPLETE_FRAMES;
 }
 
 void PSConvertAVCodecStream::ApplyStartTime(const IPSConvertStreamInfo& info) {
@@ -195,11 +230,49 @@ int PSConvertAVCodecStream::WritePacket(const _PSFILE_PACKET& packet) {
   if (packet.streamIndex >= kMaxConvertStreams) return 0;
   StreamSlot& slot = m_slots[packet.streamIndex];
   if (slot.stream == nullptr) return 0;
-  if (m_headerWritten) return WriteToContainer(&slot, packet);
   if (m_headerFailed) return kConvertHeaderFailed;
+  const int order = PictureOrder(&slot, packet);
+  if (m_headerWritten) return WriteToContainer(&slot, packet, order);
   CollectConfiguration(&slot, packet);
-  HoldBack(packet);
-  return AllConfigured() ? WriteHeader() : 0;
+  NoteFirstGop(&slot, packet, order);
+  HoldBack(packet, order);
+  return ReadyForHeader() ? WriteHeader() : 0;
+}
+
+int PSConvertAVCodecStream::PictureOrder(StreamSlot* slot, const _PSFILE_PACKET& packet) {
+  if (slot->parser == nullptr || slot->parserCodec == nullptr || packet.data == nullptr ||
+      packet.size == 0) {
+    return kNoPictureOrder;
+  }
+  // The parser's bit reader may look past the end by up to the padding, and
+  // the caller's bytes end where the frame does.
+  m_parserInput.assign(packet.data, packet.data + packet.size);
+  m_parserInput.resize(packet.size + AV_INPUT_BUFFER_PADDING_SIZE, 0);
+  slot->parser->output_picture_number = kNoPictureOrder;
+  uint8_t* out = nullptr;
+  int outSize = 0;
+  m_libs.av_parser_parse2(slot->parser, slot->parserCodec, &out, &outSize, m_parserInput.data(),
+                          static_cast<int>(packet.size), AV_NOPTS_VALUE, AV_NOPTS_VALUE, 0);
+  return outSize > 0 ? slot->parser->output_picture_number : kNoPictureOrder;
+}
+
+void PSConvertAVCodecStream::NoteFirstGop(StreamSlot* slot, const _PSFILE_PACKET& packet,
+                                          int order) {
+  if (packet.frameType == kPSKeyFrame && ++slot->keyFramesSeen > 1) return;
+  if (slot->keyFramesSeen != 1 || order == kNoPictureOrder) return;
+  if (packet.frameType != kPSKeyFrame && order < slot->highestOrder) slot->reorders = true;
+  slot->highestOrder =
+      packet.frameType == kPSKeyFrame ? order : std::max(slot->highestOrder, order);
+}
+
+bool PSConvertAVCodecStream::ReadyForHeader() const {
+  if (!AllConfigured()) return false;
+  // The movie header's room depends on whether frames are reordered, which
+  // the first group of pictures shows.
+  for (const StreamSlot& slot : m_slots) {
+    if (slot.parser != nullptr && slot.keyFramesSeen < 2) return false;
+  }
+  return true;
 }
 
 void PSConvertAVCodecStream::CollectConfiguration(StreamSlot* slot, const _PSFILE_PACKET& packet) {
@@ -238,8 +311,9 @@ bool PSConvertAVCodecStream::AllConfigured() const {
   return true;
 }
 
-void PSConvertAVCodecStream::HoldBack(const _PSFILE_PACKET& packet) {
+void PSConvertAVCodecStream::HoldBack(const _PSFILE_PACKET& packet, int order) {
   HeldPacket held;
+  held.order = order;
   held.packet = packet;
   held.packet.data = nullptr;
   if (packet.data != nullptr) held.payload.assign(packet.data, packet.data + packet.size);
@@ -251,7 +325,9 @@ int PSConvertAVCodecStream::WriteHeader() {
   if (m_headerWritten) return 0;
   m_libs.av_dict_set(&m_formatOptions, "use_editlist", "0", 0);
   for (const PSConvertOption& option : m_options) {
-    m_libs.av_dict_set(&m_formatOptions, option.name.c_str(), option.value.c_str(), option.flags);
+    const std::string value =
+        option.name == kMovieHeaderOption ? MovieHeaderSize(option.value) : option.value;
+    m_libs.av_dict_set(&m_formatOptions, option.name.c_str(), value.c_str(), option.flags);
   }
   if (m_libs.avformat_write_header(m_context, &m_formatOptions) < 0) {
     // A container that failed its header is in no state to be asked again.
@@ -263,60 +339,120 @@ int PSConvertAVCodecStream::WriteHeader() {
   return WriteHeldBack();
 }
 
+std::string PSConvertAVCodecStream::MovieHeaderSize(const std::string& requested) const {
+  char* end = nullptr;
+  const long long asked = strtoll(requested.c_str(), &end, 10);
+  if (end == requested.c_str() || *end != '\0') return requested;  // the container judges it
+  uint64_t needed = 0;
+  for (const StreamSlot& slot : m_slots) {
+    if (slot.stream == nullptr || !slot.extentKnown) continue;
+    MovieTrackShape track;
+    track.samples = slot.extent.frames;
+    track.keyFrames = slot.extent.keyFrames;
+    track.mediaBytes = slot.extent.bytes * kStoredBytesPerPayloadByte;
+    track.configBytes = static_cast<uint64_t>(slot.stream->codecpar->extradata_size);
+    const AVRational tick = slot.stream->time_base;
+    track.evenFrameDuration =
+        (int64_t{tick.den} * slot.frameRate.den) % (int64_t{tick.num} * slot.frameRate.num) == 0;
+    track.reordered = slot.reorders;
+    needed += MovieHeaderBound(track);
+  }
+  // A header that fits keeps the room asked for, so such files stay as
+  // they always were.
+  if (asked >= 0 && needed <= static_cast<uint64_t>(asked)) return requested;
+  return std::to_string(needed);
+}
+
 int PSConvertAVCodecStream::WriteHeldBack() {
   std::vector<HeldPacket> held;
   held.swap(m_heldBack);
   for (HeldPacket& entry : held) {
     entry.packet.data = entry.payload.data();
-    const int result = WriteToContainer(&m_slots[entry.packet.streamIndex], entry.packet);
+    const int result =
+        WriteToContainer(&m_slots[entry.packet.streamIndex], entry.packet, entry.order);
     if (result < 0) return result;
   }
   return 0;
 }
 
-int PSConvertAVCodecStream::WriteToContainer(StreamSlot* slot, const _PSFILE_PACKET& packet) {
-  const int filled = FillPayload(*slot, packet);
-  if (filled <= 0) return filled;  // nothing to write, or out of memory
+int PSConvertAVCodecStream::WriteToContainer(StreamSlot* slot, const _PSFILE_PACKET& packet,
+                                             int order) {
+  const bool key = packet.frameType == kPSKeyFrame;
+  if (slot->parser == nullptr) {
+    const int filled = FillPayload(packet.data, packet.size);
+    if (filled <= 0) return filled;  // nothing to write, or out of memory
+    return Mux(slot, key, slot->frameCounter);
+  }
+  if (key) {
+    const int result = WriteGop(slot);
+    if (result < 0) return result;
+  }
+  if (packet.data == nullptr) return 0;
+  SplitNalUnits(packet.data, packet.size, &m_units);
+  if (m_units.empty()) return 0;
+  GopFrame frame;
+  frame.key = key;
+  frame.order = order;
+  frame.data.resize(PrefixedSize(m_units));
+  WritePrefixed(m_units, m_isAvi, frame.data.data());
+  slot->gop.push_back(std::move(frame));
+  return 0;
+}
+
+int PSConvertAVCodecStream::WriteGop(StreamSlot* slot) {
+  std::vector<GopFrame> gop;
+  gop.swap(slot->gop);
+  const std::vector<int64_t> ranks = DisplayRanks(gop, kNoPictureOrder);
+  // A frame shown before frames decoded ahead of it makes presentation trail
+  // decoding by that many frames from here on; the depth never shrinks, so
+  // that presentation times keep rising from one group to the next.
+  for (size_t i = 0; i < gop.size(); ++i) {
+    slot->reorderDepth = std::max(slot->reorderDepth, static_cast<int64_t>(i) - ranks[i]);
+  }
+  const int64_t first = slot->frameCounter;
+  for (size_t i = 0; i < gop.size(); ++i) {
+    const int filled = FillPayload(gop[i].data.data(), gop[i].data.size());
+    if (filled < 0) return filled;
+    const int result = Mux(slot, gop[i].key, first + ranks[i] + slot->reorderDepth);
+    if (result < 0) return result;
+  }
+  return 0;
+}
+
+int PSConvertAVCodecStream::Mux(StreamSlot* slot, bool key, int64_t presentation) {
   // Time counts frames at the stream's constant rate, whatever the
   // packets' own times say.
   const AVRational frame = av_inv_q(slot->frameRate);
   const AVRational timeBase = slot->stream->time_base;
-  const int64_t pts = m_libs.av_rescale_q(slot->frameCounter, frame, timeBase);
+  const int64_t dts = m_libs.av_rescale_q(slot->frameCounter, frame, timeBase);
   const int64_t next = m_libs.av_rescale_q(slot->frameCounter + 1, frame, timeBase);
   ++slot->frameCounter;
   m_avPacket->stream_index = slot->stream->index;
-  m_avPacket->flags = packet.frameType == kPSKeyFrame ? AV_PKT_FLAG_KEY : 0;
-  m_avPacket->pts = pts;
-  m_avPacket->dts = pts;
-  m_avPacket->duration = next - pts;
+  m_avPacket->flags = key ? AV_PKT_FLAG_KEY : 0;
+  m_avPacket->pts = m_libs.av_rescale_q(presentation, frame, timeBase);
+  m_avPacket->dts = dts;
+  m_avPacket->duration = next - dts;
   return m_libs.av_interleaved_write_frame(m_context, m_avPacket);
 }
 
-int PSConvertAVCodecStream::FillPayload(const StreamSlot& slot, const _PSFILE_PACKET& packet) {
+int PSConvertAVCodecStream::FillPayload(const uint8_t* data, size_t size) {
   m_libs.av_packet_unref(m_avPacket);
-  if (packet.data == nullptr || packet.size == 0) return 0;
-  if (!IsNalCodec(slot.codec)) {
-    if (m_libs.av_new_packet(m_avPacket, static_cast<int>(packet.size)) < 0) {
-      return AVERROR(ENOMEM);
-    }
-    memcpy(m_avPacket->data, packet.data, packet.size);
-    return 1;
-  }
-  // The caller's bytes are shared with other clips and the stream's
-  // history, so the new framing is built in the packet's own buffer.
-  SplitNalUnits(packet.data, packet.size, &m_units);
-  if (m_units.empty()) return 0;
-  if (m_libs.av_new_packet(m_avPacket, static_cast<int>(PrefixedSize(m_units))) < 0) {
-    return AVERROR(ENOMEM);
-  }
-  WritePrefixed(m_units, m_isAvi, m_avPacket->data);
+  if (data == nullptr || size == 0) return 0;
+  if (m_libs.av_new_packet(m_avPacket, static_cast<int>(size)) < 0) return AVERROR(ENOMEM);
+  memcpy(m_avPacket->data, data, size);
   return 1;
 }
 
 int PSConvertAVCodecStream::Close() {
   if (m_context == nullptr) return 0;
   int result = kConvertHeaderFailed;
-  if (m_headerWritten) result = m_libs.av_write_trailer(m_context);
+  if (m_headerWritten) {
+    // A failed write leaves the frames before it, as a stop of the caller does.
+    for (StreamSlot& slot : m_slots) {
+      if (slot.stream != nullptr) WriteGop(&slot);
+    }
+    result = m_libs.av_write_trailer(m_context);
+  }
   Release(result < 0);
   return result;
 }
@@ -333,8 +469,17 @@ void PSConvertAVCodecStream::Release(bool removeFile) {
   if (m_formatOptions != nullptr) m_libs.av_dict_free(&m_formatOptions);
   if (m_avPacket != nullptr) m_libs.av_packet_unref(m_avPacket);
   m_heldBack.clear();
+  ReleaseParsers();
   m_slots = {};
   m_headerWritten = false;
+}
+
+void PSConvertAVCodecStream::ReleaseParsers() {
+  for (StreamSlot& slot : m_slots) {
+    if (slot.parser != nullptr) m_libs.av_parser_close(slot.parser);
+    if (slot.parserCodec != nullptr) m_libs.avcodec_free_context(&slot.parserCodec);
+    slot.parser = nullptr;
+  }
 }
 
 bool PSConvertAVCodecStream::CanWrite(const std::string& fileName) {

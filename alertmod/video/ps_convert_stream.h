@@ -7,12 +7,18 @@
 // the muxer; PSConvertAVCodecStream implements it on FFmpeg. A stream the
 // container cannot store fails Open: this muxer does not re-encode.
 //
+// H.264 and H.265 frames are held a group of pictures at a time (from one key
+// frame to the next): the codec libraries' parser gives each frame's picture
+// order, from which the frames get their presentation times in display
+// order, so that streams with B-frames play as they were shot.
+//
 // One muxer is used by one thread at a time (the notification worker). The
 // payload bytes handed to WritePacket are only read, never changed.
 #ifndef ALERTMOD_VIDEO_PS_CONVERT_STREAM_H_
 #define ALERTMOD_VIDEO_PS_CONVERT_STREAM_H_
 
 #include <array>
+#include <climits>
 #include <cstdint>
 #include <string>
 #include <vector>
@@ -29,6 +35,13 @@ constexpr uint32_t kMaxConvertStreams = 48;
 // Open's result on failure, and the header failure of Close and WriteHeader.
 constexpr int kConvertOpenFailed = -1;
 constexpr int kConvertHeaderFailed = -2;
+
+// The most a caller will write of one stream.
+struct PSStreamExtent {
+  uint64_t frames = 0;
+  uint64_t keyFrames = 0;
+  uint64_t bytes = 0;  // payload bytes of all frames
+};
 
 // Describes the streams of a packet file to the muxer.
 class IPSConvertStreamInfo {
@@ -47,6 +60,14 @@ class IPSConvertStreamInfo {
     (void)index;
     (void)width;
     (void)height;
+    return false;
+  }
+  // What will be written of stream `index` at most, when known: a movie
+  // header reserved through the "moov_size" option then grows to hold it.
+  // Returns false when not known.
+  virtual bool GetStreamExtent(uint32_t index, PSStreamExtent* extent) const {
+    (void)index;
+    (void)extent;
     return false;
   }
 };
@@ -68,11 +89,14 @@ class IPSConvertStream {
   virtual int Open(const PSFileHeader& header, const IPSConvertStreamInfo& info,
                    const std::string& fileName) = 0;
   // Writes one packet. The container header is written once every stream's
-  // configuration is known; packets before that are held back (copied).
-  // Returns a negative value on failure; packets of unknown streams are
-  // ignored (0).
+  // configuration is known and every H.264 and H.265 stream has shown its
+  // first group of pictures whole; packets before that are held back
+  // (copied). Returns a negative value on failure, also one of writing the
+  // group of pictures that a key frame closes; packets of unknown streams
+  // are ignored (0).
   virtual int WritePacket(const _PSFILE_PACKET& packet) = 0;
-  // Writes the header if still due, finishes and closes the file. Returns
+  // Writes the header if still due and the frames still held, finishes and
+  // closes the file. Returns
   // the trailer's result, kConvertHeaderFailed when the header could not be
   // written, and 0 when nothing is open. A file that could not be finished
   // is removed, so a broken file is never left behind.
@@ -83,7 +107,9 @@ class IPSConvertStream {
   virtual int WriteHeader() = 0;
   // True when the name gives a container format.
   virtual bool CanWrite(const std::string& fileName) = 0;
-  // Replaces the options applied when the header is written.
+  // Replaces the options applied when the header is written. A "moov_size"
+  // too small for the extent that the stream description gives is raised
+  // to fit it.
   virtual void SetOptions(const std::vector<PSConvertOption>& options) = 0;
   // Frames per second of stream `index`: -1 when it has no frame rate, 0
   // when there is no such stream.
@@ -112,17 +138,37 @@ class PSConvertAVCodecStream final : public IPSConvertStream {
   int64_t FrameDuration(uint32_t index) override;
 
  private:
+  // The parser could not tell a frame's place in display order.
+  static constexpr int kNoPictureOrder = INT_MIN;
+  // One frame of the group of pictures being held, in its stored framing.
+  struct GopFrame {
+    std::vector<uint8_t> data;
+    bool key = false;
+    int order = 0;  // picture order, or kNoPictureOrder
+  };
   struct StreamSlot {
     AVStream* stream = nullptr;
     uint8_t codec = kPSCodecNone;
     AVRational frameRate{0, 1};
     ParameterSets parameterSets;
-    bool configured = false;  // the container has what it needs
-    int64_t frameCounter = 0;
+    bool configured = false;   // the container has what it needs
+    int64_t frameCounter = 0;  // frames written, in decoding order
+    PSStreamExtent extent;
+    bool extentKnown = false;
+    // Picture order (H.264, H.265 only).
+    AVCodecParserContext* parser = nullptr;
+    AVCodecContext* parserCodec = nullptr;
+    std::vector<GopFrame> gop;
+    int64_t reorderDepth = 0;  // frames by which presentation trails decoding
+    // Before the header: what the first group of pictures showed.
+    uint32_t keyFramesSeen = 0;
+    int highestOrder = 0;
+    bool reorders = false;
   };
   struct HeldPacket {
     _PSFILE_PACKET packet;
     std::vector<uint8_t> payload;
+    int order = 0;
   };
 
   bool Usable() const;
@@ -133,14 +179,26 @@ class PSConvertAVCodecStream final : public IPSConvertStream {
   bool CreateStream(const IPSConvertStreamInfo& info, uint32_t index,
                     const PSStreamDescriptor& descriptor);
   void ApplyStartTime(const IPSConvertStreamInfo& info);
+  void CreateParser(StreamSlot* slot, AVCodecID id);
+  int PictureOrder(StreamSlot* slot, const _PSFILE_PACKET& packet);
+  void NoteFirstGop(StreamSlot* slot, const _PSFILE_PACKET& packet, int order);
+  bool ReadyForHeader() const;
+  std::string MovieHeaderSize(const std::string& requested) const;
   void CollectConfiguration(StreamSlot* slot, const _PSFILE_PACKET& packet);
   bool SetExtradata(StreamSlot* slot, const uint8_t* data, size_t size);
   bool AllConfigured() const;
-  void HoldBack(const _PSFILE_PACKET& packet);
+  void HoldBack(const _PSFILE_PACKET& packet, int order);
   int WriteHeldBack();
-  int WriteToContainer(StreamSlot* slot, const _PSFILE_PACKET& packet);
+  // Writes a packet after the header: other codecs at once, H.264 and H.265
+  // into the held group of pictures, which a key frame first writes out.
+  int WriteToContainer(StreamSlot* slot, const _PSFILE_PACKET& packet, int order);
+  int WriteGop(StreamSlot* slot);
+  // Writes the packet's payload as the next frame in decoding order, shown
+  // as frame `presentation`.
+  int Mux(StreamSlot* slot, bool key, int64_t presentation);
   // 1 when the packet holds the payload, 0 when there is none, else an error.
-  int FillPayload(const StreamSlot& slot, const _PSFILE_PACKET& packet);
+  int FillPayload(const uint8_t* data, size_t size);
+  void ReleaseParsers();
   void Release(bool removeFile);
 
   av_init& m_libs;
@@ -154,7 +212,8 @@ class PSConvertAVCodecStream final : public IPSConvertStream {
   bool m_headerFailed = false;  // the container refused its header; never retried
   std::array<StreamSlot, kMaxConvertStreams> m_slots;
   std::vector<HeldPacket> m_heldBack;
-  std::vector<NalUnit> m_units;  // reused between packets
+  std::vector<NalUnit> m_units;        // reused between packets
+  std::vector<uint8_t> m_parserInput;  // reused between packets
 };
 
 }  // namespace hx

@@ -126,17 +126,35 @@ TEST_F(StreamMuxerTest, DescribesItsStreams) {
 }
 
 TEST_F(StreamMuxerTest, ARefusedHeaderIsNotRetried) {
-  const cliptest::MediaRecipe recipe{kCodecH264, 320, 240, 3, 3};
+  const cliptest::MediaRecipe recipe{kCodecH264, 320, 240, 3, 1};
   const std::vector<cliptest::MediaFrame> frames = cliptest::MakeFrames(recipe, m_dir.path());
   ASSERT_EQ(frames.size(), 3u);
   PSConvertAVCodecStream muxer;
   muxer.SetOptions({{"moov_size", "not a number", 0}});
   const std::string path = m_dir.File("refused.mov");
   ASSERT_EQ(muxer.Open(PSFileHeader(), OneVideoStream(kPSCodecH264, 320, 240, 25), path), 0);
-  EXPECT_EQ(muxer.WritePacket(Packet(frames[0].payload, true, 1000)), kConvertHeaderFailed);
-  EXPECT_EQ(muxer.WritePacket(Packet(frames[1].payload, false, 1040)), kConvertHeaderFailed);
+  // The header waits until the first group of pictures is whole.
+  EXPECT_EQ(muxer.WritePacket(Packet(frames[0].payload, true, 1000)), 0);
+  EXPECT_EQ(muxer.WritePacket(Packet(frames[1].payload, true, 1040)), kConvertHeaderFailed);
+  EXPECT_EQ(muxer.WritePacket(Packet(frames[2].payload, true, 1080)), kConvertHeaderFailed);
   EXPECT_EQ(muxer.WriteHeader(), kConvertHeaderFailed);
   EXPECT_EQ(muxer.Close(), kConvertHeaderFailed);
+  EXPECT_FALSE(testsupport::FileExists(path));
+}
+
+TEST_F(StreamMuxerTest, AFileThatCannotBeFinishedIsRemoved) {
+  const cliptest::MediaRecipe recipe{kCodecH264, 320, 240, 3, 1};
+  const std::vector<cliptest::MediaFrame> frames = cliptest::MakeFrames(recipe, m_dir.path());
+  ASSERT_EQ(frames.size(), 3u);
+  PSConvertAVCodecStream muxer;
+  // No room for the movie header, and no extent to raise it by.
+  muxer.SetOptions({{"moov_size", "100", 0}});
+  const std::string path = m_dir.File("unfinished.mov");
+  ASSERT_EQ(muxer.Open(PSFileHeader(), OneVideoStream(kPSCodecH264, 320, 240, 25), path), 0);
+  for (size_t i = 0; i < frames.size(); ++i) {
+    ASSERT_EQ(muxer.WritePacket(Packet(frames[i].payload, true, 1000 + 40 * i)), 0) << i;
+  }
+  EXPECT_LT(muxer.Close(), 0);
   EXPECT_FALSE(testsupport::FileExists(path));
 }
 

@@ -54,6 +54,12 @@ bool CStreamInfo::GetStreamSize(uint32_t index, uint32_t* width, uint32_t* heigh
   return true;
 }
 
+bool CStreamInfo::GetStreamExtent(uint32_t index, hx::PSStreamExtent* extent) const {
+  if (index != 0 || extent == nullptr || !m_extentKnown) return false;
+  *extent = m_extent;
+  return true;
+}
+
 bool CStreamInfo::LibrariesReady() {
   if (m_libs.AllLoaded()) return true;
   return m_libs.Reload();

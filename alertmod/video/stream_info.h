@@ -22,7 +22,8 @@ namespace videomake {
 constexpr int64_t kKeyFrameGapLogMs = 1500;
 
 // The muxer options every clip is written with: the movie header is
-// reserved at the start of the file ("moov_size" 16352). Built once.
+// reserved at the start of the file ("moov_size" 16352, more when the
+// clip's extent needs it). Built once.
 const std::vector<hx::PSConvertOption>& ClipMuxerOptions();
 
 class CStreamInfo final : public hx::IPSConvertStreamInfo {
@@ -44,6 +45,14 @@ class CStreamInfo final : public hx::IPSConvertStreamInfo {
   int64_t GetStartTime() const override { return m_startTime; }
   double GetFrameRate() const override { return static_cast<double>(m_fps); }
   bool GetStreamSize(uint32_t index, uint32_t* width, uint32_t* height) const override;
+  bool GetStreamExtent(uint32_t index, hx::PSStreamExtent* extent) const override;
+
+  // Tells the most that will be offered, before the first frame: the file's
+  // movie header is then reserved large enough for it.
+  void SetExtent(const hx::PSStreamExtent& extent) {
+    m_extent = extent;
+    m_extentKnown = true;
+  }
 
   // Offers the frame of `size` bytes at `data` (the payload only), which
   // arrived at `timeMs`. Returns true while the caller should go on
@@ -82,6 +91,8 @@ class CStreamInfo final : public hx::IPSConvertStreamInfo {
   int64_t m_maxSpanMs;
   bool m_started = false;
   std::string m_path;
+  hx::PSStreamExtent m_extent;
+  bool m_extentKnown = false;
   std::unique_ptr<ActiveClip> m_activeClip;
   hx::core::HostCallbackFn m_callback;
   hx::av_init& m_libs;
