@@ -9,7 +9,7 @@ namespace {
 // track, media and handler headers, data reference, sample description,
 // metadata. About 600 bytes in practice; the rest is room for what a newer
 // release of the libraries may add.
-constexpr uint64_t kFixedBoxesBytes = 1536;
+constexpr uint64_t kFixedBoxesBytes = 1024;
 // Size, type, version and flags, entry count; the sample-size table also
 // carries a common size.
 constexpr uint64_t kTableHeaderBytes = 20;
