@@ -351,9 +351,11 @@ std::string PSConvertAVCodecStream::MovieHeaderSize(const std::string& requested
     track.keyFrames = slot.extent.keyFrames;
     track.mediaBytes = slot.extent.bytes * kStoredBytesPerPayloadByte;
     track.configBytes = static_cast<uint64_t>(slot.stream->codecpar->extradata_size);
+    // One frame lasts tick.den * den / (tick.num * num) ticks.
     const AVRational tick = slot.stream->time_base;
+    const int64_t divisor = int64_t{tick.num} * slot.frameRate.num;
     track.evenFrameDuration =
-        (int64_t{tick.den} * slot.frameRate.den) % (int64_t{tick.num} * slot.frameRate.num) == 0;
+        divisor != 0 && (int64_t{tick.den} * slot.frameRate.den) % divisor == 0;
     track.reordered = slot.reorders;
     needed += MovieHeaderBound(track);
   }
