@@ -9,6 +9,7 @@
 
 #include <cstdio>
 #include <regex>
+#include <sstream>
 #include <string>
 
 #include "alertmod/host_records.h"
@@ -52,10 +53,15 @@ class ClipEmailTest : public testsupport::ModuleHostTest {
   void SetUp() override {
     ModuleHostTest::SetUp();
     m_video = dir().File("lobby.mp4");
+    MakeVideo(0);
+  }
+
+  void MakeVideo(int bframes) {
     std::string command =
         "ffmpeg -nostdin -v error -y -f lavfi -i testsrc=size=320x240:rate=25 -frames:v 250 "
-        "-c:v libx264 -bf 0 -pix_fmt yuv420p -x264-params keyint=25:min-keyint=25:scenecut=0 '" +
-        m_video + "'";
+        "-c:v libx264 -bf " +
+        std::to_string(bframes) +
+        " -pix_fmt yuv420p -x264-params keyint=25:min-keyint=25:scenecut=0 '" + m_video + "'";
     ASSERT_EQ(std::system(command.c_str()), 0) << "ffmpeg is needed: " << command;
   }
 
@@ -190,6 +196,22 @@ TEST_F(ClipEmailTest, TheReceivedClipPlaysForTheCapturedSpan) {
   EXPECT_EQ(Capture("ffmpeg -nostdin -v error -i '" + clip + "' -f null - 2>&1"), "");
   host().Stop();
   EXPECT_EQ(host().Frames().Counts().outstanding, 0u);
+}
+
+TEST_F(ClipEmailTest, ACameraSendingBFramesGivesAClipShownInDisplayOrder) {
+  MakeVideo(2);
+  Start("See the clip.", "");
+  PlayWithAlarmAt(100);
+  ASSERT_TRUE(m_smtp.WaitForMessages(1, 60s));
+  Unpack(0);
+  std::string clip = dir().File("mail0/Lobby.mov");
+  std::istringstream shown(Capture(
+      "ffprobe -v error -select_streams v:0 -show_entries frame=pts -of csv=p=0 '" + clip + "'"));
+  std::vector<long long> times;
+  for (std::string line; std::getline(shown, line);) times.push_back(std::stoll(line));
+  EXPECT_GT(times.size(), 75u);
+  for (size_t i = 1; i < times.size(); ++i) ASSERT_LT(times[i - 1], times[i]) << i;
+  EXPECT_EQ(Capture("ffmpeg -nostdin -v error -i '" + clip + "' -f null - 2>&1"), "");
 }
 
 TEST_F(ClipEmailTest, TheWebLinkPointsAtTheCamerasAroundTheEvent) {
