@@ -4,6 +4,7 @@
 #include <atomic>
 #include <boost/asio/write.hpp>
 #include <boost/system/system_error.hpp>
+#include <cstddef>
 #include <utility>
 
 namespace hx {
@@ -70,6 +71,16 @@ class SocketReplyStream final : public IReplyStream {
   Deadline m_deadline;
 };
 
+// The end of one connection attempt when `untried` addresses (this one
+// included) are left: an equal share of the time remaining. An address that
+// drops the request then leaves the later ones their turn, while the last
+// one gets whatever is left, so that the exchange stays within its bound.
+Deadline AttemptDeadline(Deadline exchangeDeadline, std::ptrdiff_t untried) {
+  const auto now = std::chrono::steady_clock::now();
+  if (untried <= 1 || exchangeDeadline <= now) return exchangeDeadline;
+  return now + (exchangeDeadline - now) / untried;
+}
+
 // An IPv6 address configured without a port keeps its brackets, which name
 // resolution does not accept.
 std::string ResolvableHost(const std::string& host) {
@@ -116,11 +127,10 @@ void HttpGetClient::Connect(tcp::socket& socket, const Endpoints& endpoints, Dea
       socket.close(closeError);
       if (closeError) throw system_error(closeError, "close");
     }
-    error = AwaitOperation(m_io, socket, deadline, [&](auto handler) {
-      socket.async_connect(*it, [handler](const error_code& ec) mutable { handler(ec, 0); });
-    });
-    // The time-out bounds the whole exchange; no later address gets a turn.
-    if (error == boost::asio::error::timed_out) break;
+    error = AwaitOperation(
+        m_io, socket, AttemptDeadline(deadline, endpoints.end() - it), [&](auto handler) {
+          socket.async_connect(*it, [handler](const error_code& ec) mutable { handler(ec, 0); });
+        });
   }
   if (error) throw system_error(error, "Unable to connect to endpoint");
 }

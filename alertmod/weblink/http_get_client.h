@@ -40,7 +40,10 @@ class HttpGetClient {
   HttpGetClient& operator=(const HttpGetClient&) = delete;
 
   // Sends "GET `path` HTTP/1.0" (path starts with "/", may carry a query) and
-  // fills `response` with a reply of status 200.
+  // fills `response` with a reply of status 200. The resolved addresses are
+  // tried in order until one takes the connection, each attempt within an
+  // equal share of the time-out left, so that an address that drops the
+  // request still leaves the later ones their turn.
   //
   // Throws boost::system::system_error when the server cannot be reached or
   // the transfer fails, its text naming the step: "resolve", "close",
