@@ -79,7 +79,7 @@ int32_t Load(hx::core::LoadParmsIn* in, hx::core::LoadParmsOut* out) {
       hx::SetCurrentManager(new hx::NotifyManager(callback, hx::DefaultWorkerJobFactory(callback)));
     }
     if (out != nullptr) FillLoadParmsOut(out);
-    hx::ipc::RegisterProcessService(kModuleId, &SendProcessMessageToHost);
+    hx::ipc::RegisterProcessService(kModuleId, &SendProcessMessageToHost, callback);
   });
 }
 

@@ -256,25 +256,32 @@ TEST_F(FaultInjectionTest, MissingTransferToolFailsEachMessageCleanly) {
   ExpectNothingLeftBehind();
 }
 
-// The host refuses every process message, or takes the start and then
-// refuses the program's input, which the transfer tool waits for. Either way
-// the delivery fails at once and the next notification is still handled.
+// The host refuses every process message, takes the start and then refuses
+// the program's input, which the transfer tool waits for, or takes the start
+// and never answers it, not even the capability probe's at Open. Either way
+// the delivery fails (at once, or when the answer is overdue) and the next
+// notification is still handled.
 TEST_F(FaultInjectionTest, HostRefusingProcessMessages) {
-  for (bool startAccepted : {false, true}) {
-    SCOPED_TRACE(startAccepted ? "input refused" : "everything refused");
+  enum StartHandling { kStartRefused, kInputRefused, kStartSwallowed };
+  for (StartHandling handling : {kStartRefused, kInputRefused, kStartSwallowed}) {
+    SCOPED_TRACE(handling);
     SmtpTestServer smtp;
     std::unique_ptr<refhost::ProcessService> service;
     Start(smtp.port(), ToolScript(), [&](refhost::ReferenceHost& host) {
+      auto setStartTimeout = reinterpret_cast<testhooks::SetStartAnswerTimeoutMsFn>(
+          host.Hook("SetStartAnswerTimeoutMs"));
+      ASSERT_NE(setStartTimeout, nullptr);
+      setStartTimeout(300);
       service = std::make_unique<refhost::ProcessService>(
           ToolScript(), [&host](const void* data, uint32_t length) {
             host.Ioctl(hx::core::kIoctlProcessMessage, data, length);
           });
-      host.SetHandler(hx::core::kClassProcess, [&, startAccepted](hx::core::HostRequest& r) {
+      host.SetHandler(hx::core::kClassProcess, [&, handling](hx::core::HostRequest& r) {
         hx::core::ProcessMessageHeader header{};
         if (r.data == nullptr || r.length < sizeof(header)) return -1;
         memcpy(&header, r.data, sizeof(header));
-        const bool start = header.type == hx::core::kProcessStart;
-        return startAccepted && start ? service->Handle(r) : -1;
+        if (header.type != hx::core::kProcessStart || handling == kStartRefused) return -1;
+        return handling == kInputRefused ? service->Handle(r) : 0;
       });
     });
     PlainAlarm();
@@ -283,6 +290,8 @@ TEST_F(FaultInjectionTest, HostRefusingProcessMessages) {
     EXPECT_TRUE(
         host().Log().Contains("Failed to execute curl smtp operation using server local. "
                               "(Profile Description: Front door)"));
+    EXPECT_EQ(host().Log().Contains("The host did not answer the start of ./curl within 300 ms"),
+              handling == kStartSwallowed);
     EXPECT_TRUE(MessageFiles().empty());
     service->Stop();
     ExpectNothingLeftBehind();

@@ -5,6 +5,8 @@
 #include <cstring>
 #include <map>
 
+#include "alertmod/diag/log.h"
+
 namespace hx {
 namespace ipc {
 namespace {
@@ -27,6 +29,7 @@ class ProcessRegistry final {
   uint32_t lastId = 0;
   uint32_t moduleId = 0;
   std::atomic<SendFunction> send{nullptr};
+  std::atomic<core::HostCallbackFn> logTo{nullptr};
 
  private:
   ProcessRegistry() = default;
@@ -36,6 +39,8 @@ class ProcessRegistry final {
 constexpr uint32_t kCounterAttempts = kIdCounterMask + 1;
 
 constexpr size_t kMaxPayloadBytes = core::kProcessMessageMaxBytes - core::kProcessHeaderBytes;
+
+std::atomic<int64_t> g_startAnswerTimeoutMs{kDefaultStartAnswerTimeout.count()};
 
 bool SendOne(SendFunction send, uint32_t id, uint32_t type, uint32_t value, const char* payload,
              size_t length, std::vector<unsigned char>& message) {
@@ -91,28 +96,56 @@ void SetState(client& process, int32_t state) {
   process.state = state;
 }
 
-// Gives up a run whose input the host refused: the program would wait for
-// the end of its input, and its caller with it, until Close. The id is
-// forgotten, so that anything the host still sends for it is dropped.
-// Returns false when the run has ended meanwhile and its result stands.
-bool Abandon(const std::shared_ptr<client>& process) {
+// Gives up a run: the id is forgotten, so that anything the host still sends
+// for it is dropped, and the run counts as failed. Returns false, changing
+// nothing, when the run has reached `settled` meanwhile and its result
+// stands.
+template <typename Settled>
+bool Abandon(const std::shared_ptr<client>& process, Settled settled) {
   ProcessRegistry& registry = ProcessRegistry::Instance();
   std::lock_guard<std::mutex> lock(registry.lock);
   std::lock_guard<std::mutex> clientLock(process->lock);
-  if (process->state == kStateExited) return false;
+  if (settled(process->state)) return false;
   auto found = registry.clients.find(process->id);
   if (found != registry.clients.end() && found->second == process) registry.clients.erase(found);
   process->state = kStateFailed;
   return true;
 }
 
+// Waits for the host's answer to the start of `process`. A host that takes
+// the start and never answers would hold the caller (Open's probe, the
+// worker's delivery) for ever; past the time-out the run counts as not
+// started. An answer that comes in while it is given up still counts.
+void AwaitStartAnswer(const std::shared_ptr<client>& process, const std::string& program) {
+  const std::chrono::milliseconds timeout(g_startAnswerTimeoutMs.load());
+  const auto answered = [](int32_t state) { return state != kStateStarting; };
+  {
+    std::unique_lock<std::mutex> lock(process->lock);
+    if (process->condition.wait_for(lock, timeout, [&] { return answered(process->state); })) {
+      return;
+    }
+  }
+  if (!Abandon(process, answered)) return;
+  ProcessRegistry& registry = ProcessRegistry::Instance();
+  uint32_t moduleId = 0;
+  {
+    std::lock_guard<std::mutex> lock(registry.lock);
+    moduleId = registry.moduleId;
+  }
+  LogToHost(moduleId, registry.logTo.load(), LogLevelError,
+            "The host did not answer the start of %s within %lld ms. The program counts as not "
+            "started.",
+            program.c_str(), static_cast<long long>(timeout.count()));
+}
+
 }  // namespace
 
-void RegisterProcessService(uint32_t moduleId, SendFunction send) {
+void RegisterProcessService(uint32_t moduleId, SendFunction send, core::HostCallbackFn logTo) {
   ProcessRegistry& registry = ProcessRegistry::Instance();
   std::lock_guard<std::mutex> lock(registry.lock);
   registry.moduleId = moduleId;
   registry.send.store(send);
+  registry.logTo.store(logTo);
   registry.closed = false;
 }
 
@@ -217,8 +250,7 @@ std::shared_ptr<client> StartProcess(const ProcessOptions& options) {
     }
     registry.clients[id] = process;
   }
-  std::unique_lock<std::mutex> lock(process->lock);
-  process->condition.wait(lock, [&] { return process->state != kStateStarting; });
+  AwaitStartAnswer(process, options.arguments[0]);
   return process;
 }
 
@@ -273,7 +305,11 @@ bool RunProcess(const std::vector<std::string>& arguments, const std::string& in
   if (inputSent && !input.empty() && input.size() % kMaxPayloadBytes == 0) {
     inputSent = SendProcessMessage(process->id, core::kProcessInput, 1, nullptr, 0);
   }
-  if (!inputSent && Abandon(process)) return false;
+  // Without its input the program would wait for the end of it, and its
+  // caller with it, until Close: the run is given up unless it has ended.
+  if (!inputSent && Abandon(process, [](int32_t state) { return state == kStateExited; })) {
+    return false;
+  }
   std::string line;
   while (ReadOutputLine(*process, line, 1)) errorLines.push_back(line);
   WaitForExit(*process);
@@ -282,6 +318,10 @@ bool RunProcess(const std::vector<std::string>& arguments, const std::string& in
   if (process->state != kStateExited) return false;
   exitCode = process->value;
   return true;
+}
+
+void SetStartAnswerTimeout(std::chrono::milliseconds timeout) {
+  g_startAnswerTimeoutMs.store(std::max<int64_t>(timeout.count(), 0));
 }
 
 void SetLastProcessId(uint32_t id) {

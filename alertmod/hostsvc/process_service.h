@@ -12,6 +12,7 @@
 #ifndef ALERTMOD_HOSTSVC_PROCESS_SERVICE_H_
 #define ALERTMOD_HOSTSVC_PROCESS_SERVICE_H_
 
+#include <chrono>
 #include <condition_variable>
 #include <cstddef>
 #include <cstdint>
@@ -63,10 +64,16 @@ class client {
   bool endInputAtWait = false;
 };
 
+// How long a start waits for the host's answer before the program counts as
+// not started.
+constexpr std::chrono::milliseconds kDefaultStartAnswerTimeout{30000};
+
 // Stores the module id and the send function and opens the service. Called by
 // Load; a new Load opens the service again after an earlier Close, since the
-// library may stay loaded in between.
-void RegisterProcessService(uint32_t moduleId, SendFunction send);
+// library may stay loaded in between. `logTo`, when given, receives the
+// service's own log lines.
+void RegisterProcessService(uint32_t moduleId, SendFunction send,
+                            core::HostCallbackFn logTo = nullptr);
 
 // Ends every run the module still waits for: a running or starting client
 // becomes failed (its result is unknown, and must not read as exit code 0)
@@ -89,7 +96,9 @@ bool SendProcessMessage(uint32_t id, uint32_t type, uint32_t value, const void* 
 // Starts a program and waits until the host says it runs or failed. The
 // returned client's state is never kStateStarting: kStateFailed when the
 // arguments are empty, the service is closed, no id is free, the host refused
-// the start or answered type 4, or the service was shut down meanwhile.
+// the start or answered type 4, the service was shut down meanwhile, or the
+// host left the start unanswered for the start-answer time-out (logged; the
+// id is forgotten, so that a late answer is dropped).
 std::shared_ptr<client> StartProcess(const ProcessOptions& options);
 
 // Takes the next line of standard output (channel 0) or standard error (1),
@@ -112,6 +121,10 @@ void WaitForExit(client& process);
 bool RunProcess(const std::vector<std::string>& arguments, const std::string& input,
                 int32_t& exitCode, std::vector<std::string>& errorLines,
                 std::string* output = nullptr);
+
+// The start-answer time-out of starts made afterwards
+// (kDefaultStartAnswerTimeout until changed). Tests shorten it.
+void SetStartAnswerTimeout(std::chrono::milliseconds timeout);
 
 // Test seam: the last id issued, so that a test can reach the counter's
 // wrap-around without a million starts.

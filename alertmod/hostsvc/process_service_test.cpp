@@ -148,6 +148,14 @@ TEST_F(ProcessServiceTest, FailedStarts) {
   EXPECT_EQ(failed->value, 2);
   EXPECT_EQ(Deliver(Message(failed->id, 5, 0)), 0);
 
+  // The host takes the start and never answers: once the answer is overdue
+  // the start has failed, and a late answer is dropped.
+  SetStartAnswerTimeout(std::chrono::milliseconds(50));
+  std::shared_ptr<client> unanswered = StartProcess(Opts({"/bin/true"}));
+  SetStartAnswerTimeout(kDefaultStartAnswerTimeout);
+  EXPECT_EQ(unanswered->state, kStateFailed);
+  EXPECT_EQ(Deliver(Message(unanswered->id, 3, 0)), 0);
+
   // The host refuses the request: the id is never registered.
   service().SetAccept(false);
   std::shared_ptr<client> refused = StartProcess(Opts({"/bin/true"}));

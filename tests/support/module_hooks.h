@@ -45,6 +45,9 @@ using RunProcessFn = void (*)(const std::vector<std::string>& arguments, const s
 // "SetLastProcessId": sets the last process id issued, so that the next start
 // takes the id after it.
 using SetLastProcessIdFn = void (*)(uint32_t id);
+// "SetStartAnswerTimeoutMs": how long program starts made afterwards wait
+// for the host's answer before the program counts as not started.
+using SetStartAnswerTimeoutMsFn = void (*)(uint32_t timeoutMs);
 
 // "SetFreeBytesQuery": replaces the free-space query of the data volume;
 // the query fills `bytes` and returns true, or returns false when the volume
