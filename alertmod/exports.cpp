@@ -66,6 +66,13 @@ void DispatchWrite(hx::NotifyManager& manager, const hx::core::WriteParmsIn& in,
   }
 }
 
+// Runs `loop` of the live manager on a thread the host lends, which Unload
+// waits for.
+void RunLentThread(void (hx::NotifyManager::*loop)()) {
+  hx::LentThreadScope lent;
+  if (hx::NotifyManager* manager = hx::CurrentManager()) (manager->*loop)();
+}
+
 }  // namespace
 
 extern "C" {
@@ -84,7 +91,17 @@ int32_t Load(hx::core::LoadParmsIn* in, hx::core::LoadParmsOut* out) {
 }
 
 int32_t Unload() {
-  return Guarded("Unload", [] { delete hx::TakeCurrentManager(); });
+  return Guarded("Unload", [] {
+    hx::NotifyManager* manager = hx::TakeCurrentManager();
+    if (manager == nullptr) return;
+    // A host may unload without Close, or before the lent threads have
+    // returned: they are stopped as Close stops them, and the manager they
+    // run on is destroyed only once both have left it.
+    manager->Shutdown();
+    hx::ipc::ShutdownProcessService(true);
+    hx::WaitForLentThreads();
+    delete manager;
+  });
 }
 
 int32_t Open() {
@@ -105,7 +122,7 @@ int32_t Close() {
 int32_t Read(hx::core::ReadParmsIn* in) {
   return Guarded("Read", [&] {
     if (in == nullptr || in->mode != hx::core::kReadModeWatchdog) return;
-    if (hx::NotifyManager* manager = hx::CurrentManager()) manager->RunWatchdog();
+    RunLentThread(&hx::NotifyManager::RunWatchdog);
   });
 }
 
@@ -125,12 +142,10 @@ int32_t Write(hx::core::WriteParmsIn* in, hx::core::WriteParmsOut* out) {
 int32_t IOCTL(hx::core::IoctlParmsIn* in) {
   return Guarded("IOCTL", [&] {
     if (in == nullptr) return;
+    if (in->code == hx::core::kIoctlRunWorker) return RunLentThread(&hx::NotifyManager::RunWorker);
     hx::NotifyManager* manager = hx::CurrentManager();
     if (manager == nullptr) return;
     switch (in->code) {
-      case hx::core::kIoctlRunWorker:
-        manager->RunWorker();
-        break;
       case hx::core::kIoctlHostDocument:
         manager->OnHostDocument(in->data, in->length);
         break;

@@ -104,12 +104,16 @@ void ReferenceHost::JoinThreads() {
 
 void ReferenceHost::Stop() {
   if (!m_module) return;
-  CloseModule();
-  JoinThreads();
+  if (m_options.closeBeforeUnload) {
+    CloseModule();
+    JoinThreads();
+  }
   m_dispatcher->Stop();
   // Programs still running are ended before the module goes away.
   m_processes.Stop();
   m_module->unload();
+  // Unload has returned, so the lent threads must have left the module.
+  JoinThreads();
   ReportFrameFaults();
   m_loaded = false;
   m_module.reset();

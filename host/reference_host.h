@@ -39,6 +39,9 @@ struct HostOptions {
   bool recordRequests = true;               // keep every request in Requests()
   std::string transferTool = "curl";        // what "./curl" runs: a path or a name on PATH
   std::string hostKeyFile = "hostkey.bin";  // password key, relative to the working directory
+  // false: Stop skips Close and calls Unload while the lent threads may still
+  // be inside the module, as a careless host would (for tests).
+  bool closeBeforeUnload = true;
 };
 
 class ReferenceHost {
@@ -69,6 +72,7 @@ class ReferenceHost {
   // Waits for the lent threads to return.
   void JoinThreads();
   // Close, join the lent threads, drain the dispatcher, Unload. Idempotent.
+  // Without closeBeforeUnload the threads are joined after Unload.
   void Stop();
 
   // Write from the dispatcher. Returns the module's result and fills `out`.

@@ -19,6 +19,7 @@
 #include <atomic>
 #include <cerrno>
 #include <chrono>
+#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <functional>
@@ -389,17 +390,25 @@ TEST_F(FaultInjectionTest, ConfigurationUpdatesDuringSlowDeliveries) {
   ExpectNothingLeftBehind();
 }
 
-TEST_F(FaultInjectionTest, CloseDuringADeliveryThatDoesNotEnd) {
-  SmtpTestServer smtp;
-  Start(smtp.port(), ToolScript("", "sleep 600 #"));
-  AlarmWithVideo();
-  ASSERT_TRUE(ToolStarted());
-  const auto start = std::chrono::steady_clock::now();
-  ExpectNothingLeftBehind();
-  EXPECT_LT(std::chrono::steady_clock::now() - start, 5s) << "Close released the worker";
-  EXPECT_TRUE(
-      host().Log().Contains("Failed to execute curl smtp operation using server local. "
-                            "(Profile Description: Lobby camera)"));
+// The host stops while both lent threads are inside the module, with Close
+// first, or with Unload alone, which must stop and wait for them as Close
+// would before it frees what they use.
+TEST_F(FaultInjectionTest, StopDuringADeliveryThatDoesNotEnd) {
+  for (bool closeBeforeUnload : {true, false}) {
+    SCOPED_TRACE(closeBeforeUnload ? "Close, then Unload" : "Unload alone");
+    SmtpTestServer smtp;
+    Options().closeBeforeUnload = closeBeforeUnload;
+    Start(smtp.port(), ToolScript("", "sleep 600 #"));
+    AlarmWithVideo();
+    ASSERT_TRUE(ToolStarted());
+    const auto start = std::chrono::steady_clock::now();
+    ExpectNothingLeftBehind();
+    EXPECT_LT(std::chrono::steady_clock::now() - start, 5s) << "the worker was released";
+    EXPECT_TRUE(
+        host().Log().Contains("Failed to execute curl smtp operation using server local. "
+                              "(Profile Description: Lobby camera)"));
+    remove(dir().File("tool-pids").c_str());
+  }
 }
 
 }  // namespace

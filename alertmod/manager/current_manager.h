@@ -20,6 +20,22 @@ void SetCurrentManager(NotifyManager* manager);
 // caller gets to destroy it. Called by the exports only.
 NotifyManager* TakeCurrentManager();
 
+// Marks, for its lifetime, a lent thread (worker or watchdog) inside the
+// module. It must begin before that thread reads CurrentManager(): then
+// either Unload sees the thread and waits for it, or the thread finds no
+// manager.
+class LentThreadScope {
+ public:
+  LentThreadScope();
+  ~LentThreadScope();
+  LentThreadScope(const LentThreadScope&) = delete;
+  LentThreadScope& operator=(const LentThreadScope&) = delete;
+};
+
+// Returns once no LentThreadScope is alive. Called by Unload after it took
+// the manager and told it to stop, before the manager is destroyed.
+void WaitForLentThreads();
+
 }  // namespace hx
 
 #endif  // ALERTMOD_MANAGER_CURRENT_MANAGER_H_

@@ -66,6 +66,11 @@ void NotifyManager::Stop() {
   QueueWorkItem(std::make_shared<NotifyWorkItem>(kWorkItemStop), true);
 }
 
+void NotifyManager::Shutdown() {
+  Stop();
+  MarkStopped();
+}
+
 size_t NotifyManager::QueuedCount() const {
   std::lock_guard<std::mutex> lock(m_queueMutex);
   return m_workQueue.size();

@@ -80,6 +80,12 @@ class NotifyManager {
   // then leaves its loop. Any thread; does not wait.
   void Stop();
 
+  // Stop(), and lets the watchdog leave at once instead of after the worker,
+  // which may never have been lent; a worker entered afterwards returns at
+  // once. For Unload, after which no lent thread may stay. Any thread; does
+  // not wait.
+  void Shutdown();
+
   // The worker loop. Returns after the stop item, or at once when the worker
   // has stopped before.
   void RunWorker();
