@@ -156,6 +156,17 @@ TEST(HostCliTest, TestProfileDeliversThroughARealSmtpServer) {
       << outcome.all();
   ASSERT_TRUE(smtp.WaitForMessages(1));
   EXPECT_TRUE(Has(smtp.Messages()[0].data, "Testing Profile")) << smtp.Messages()[0].data;
+
+  // With the server gone the summary's result is that of the test, with curl's reason.
+  smtp.Stop();
+  const Outcome failed = RunHost(dir, {"test-profile", "4", "--timeout", "30"});
+  EXPECT_EQ(failed.status, 1) << failed.all();
+  for (const char* line :
+       {"Problem:         test notification for profile 4 not delivered: curl exit code 7, "
+        "\"curl: (7) ",
+        "Result:          FAILED", "Profile 4 \"Front door\": test notification FAILED"}) {
+    EXPECT_TRUE(Has(failed.out, line)) << line << "\n" << failed.all();
+  }
 }
 
 TEST(HostCliTest, ScenarioSendsATestNotificationAndSummarisesIt) {

@@ -65,9 +65,14 @@ HostOptions ResolvedHostOptions(const CommandLine& line) {
 RunReport Play(const Scenario& scenario, const CommandLine& line, const HostOptions& options) {
   scenario::Console console(stderr, line.quiet);
   scenario::ScenarioRunner runner(scenario, options, console);
-  RunReport report = runner.Run();
+  return runner.Run();
+}
+
+bool PlayAndSummarise(const Scenario& scenario, const CommandLine& line,
+                      const HostOptions& options) {
+  const RunReport report = Play(scenario, line, options);
   PrintSummary(report, stdout);
-  return report;
+  return scenario::RunSucceeded(report);
 }
 
 bool EnterWorkDirectory(const CommandLine& line, bool temporary, WorkDirectory* directory) {
@@ -98,7 +103,7 @@ int RunScenarioCommand(const CommandLine& line) {
   const HostOptions options = ResolvedHostOptions(line);
   WorkDirectory directory;
   if (!EnterWorkDirectory(line, true, &directory)) return kExitFailed;
-  return scenario::RunSucceeded(Play(parsed.scenario, line, options)) ? kExitOk : kExitFailed;
+  return PlayAndSummarise(parsed.scenario, line, options) ? kExitOk : kExitFailed;
 }
 
 int ServeCommand(const CommandLine& line) {
@@ -119,7 +124,7 @@ int ServeCommand(const CommandLine& line) {
   const HostOptions options = ResolvedHostOptions(line);
   WorkDirectory directory;
   if (!EnterWorkDirectory(line, false, &directory)) return kExitFailed;
-  return scenario::RunSucceeded(Play(scenario, line, options)) ? kExitOk : kExitFailed;
+  return PlayAndSummarise(scenario, line, options) ? kExitOk : kExitFailed;
 }
 
 // The profile numbers of the working directory's notify.xml, listed for a
@@ -128,6 +133,21 @@ std::string ConfiguredProfiles(const std::map<int32_t, std::string>& names) {
   std::string list;
   for (const auto& entry : names) list += (list.empty() ? "" : ", ") + std::to_string(entry.first);
   return list.empty() ? "none" : list;
+}
+
+constexpr int32_t kStatusDelivered = 0;
+constexpr int32_t kStatusFailed = 1;
+constexpr int32_t kNoStatus = -2;
+
+// The last delivery report (delivered or failed) for `profile`, or kNoStatus.
+int32_t DeliveryStatus(const RunReport& report, int32_t profile) {
+  for (auto status = report.statuses.rbegin(); status != report.statuses.rend(); ++status) {
+    if (status->id == profile &&
+        (status->status == kStatusDelivered || status->status == kStatusFailed)) {
+      return status->status;
+    }
+  }
+  return kNoStatus;
 }
 
 Scenario TestScenario(int32_t profile, double timeoutSeconds) {
@@ -168,15 +188,21 @@ int TestProfileCommand(const CommandLine& line) {
                         " (profiles: " + ConfiguredProfiles(names) + ")",
                     kExitFailed);
   }
-  const RunReport report = Play(TestScenario(profile, line.timeoutSeconds), line, options);
-  for (auto status = report.statuses.rbegin(); status != report.statuses.rend(); ++status) {
-    if (status->id != profile || (status->status != 0 && status->status != 1)) continue;
-    printf("Profile %d \"%s\": %s\n", profile, names.at(profile).c_str(),
-           status->status == 0 ? "test notification delivered" : "test notification FAILED");
-    return status->status == 0 && scenario::RunSucceeded(report) ? kExitOk : kExitFailed;
+  RunReport report = Play(TestScenario(profile, line.timeoutSeconds), line, options);
+  const int32_t status = DeliveryStatus(report, profile);
+  if (status == kStatusFailed) {
+    // The run itself went well, but what it was for did not.
+    const std::string reason = scenario::DeliveryFailureReason(report);
+    report.failures.push_back(
+        "test notification for profile " + std::to_string(profile) +
+        " not delivered: " + (reason.empty() ? "the module's log tells no reason" : reason));
   }
-  printf("Profile %d \"%s\": no delivery report\n", profile, names.at(profile).c_str());
-  return kExitFailed;
+  PrintSummary(report, stdout);
+  printf("Profile %d \"%s\": %s\n", profile, names.at(profile).c_str(),
+         status == kStatusDelivered ? "test notification delivered"
+         : status == kStatusFailed  ? "test notification FAILED"
+                                    : "no delivery report");
+  return status == kStatusDelivered && scenario::RunSucceeded(report) ? kExitOk : kExitFailed;
 }
 
 // What the module made of the working directory's configuration when it was

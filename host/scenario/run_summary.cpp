@@ -18,13 +18,22 @@ bool Contains(const std::string& text, const char* fragment) {
   return text.find(fragment) != std::string::npos;
 }
 
-// Delivery and retry lines of the module's log.
-void TallyDelivery(const std::string& text, RunTally* tally) {
+// True with the transfer tool's exit code for the module's line about one
+// delivery attempt.
+bool AttemptExitCode(const std::string& text, int* exitCode) {
   static const char kAttempt[] = "Notification attempt return code= ";
   const size_t attempt = text.find(kAttempt);
-  if (attempt != std::string::npos) {
+  if (attempt == std::string::npos) return false;
+  *exitCode = std::atoi(text.c_str() + attempt + sizeof(kAttempt) - 1);
+  return true;
+}
+
+// Delivery and retry lines of the module's log.
+void TallyDelivery(const std::string& text, RunTally* tally) {
+  int exitCode = 0;
+  if (AttemptExitCode(text, &exitCode)) {
     ++tally->attempts;
-    if (std::atoi(text.c_str() + attempt + sizeof(kAttempt) - 1) == 0) ++tally->accepted;
+    if (exitCode == 0) ++tally->accepted;
   }
   if (Contains(text, "This message will be retried")) ++tally->retryQueued;
   if (Contains(text, "This message will NOT be retried")) ++tally->dropped;
@@ -159,6 +168,29 @@ RunTally TallyRun(const RunReport& report) {
     TallyAttachment(line.text, &tally);
   }
   return tally;
+}
+
+std::string DeliveryFailureReason(const RunReport& report) {
+  // The module logs the tool's error output (at information level) right
+  // after the attempt that failed; curl's own error line comes last.
+  static const char kToolError[] = "curl: (";
+  int failedExit = 0;
+  std::string toolError;
+  std::string firstError;
+  for (const LogLine& line : report.log) {
+    int exitCode = 0;
+    if (AttemptExitCode(line.text, &exitCode)) {
+      failedExit = exitCode;
+      toolError.clear();
+    } else if (failedExit != 0 && StartsWith(line.text, kToolError)) {
+      toolError = line.text;
+    } else if (line.level >= kLogError && firstError.empty()) {
+      firstError = line.text;
+    }
+  }
+  if (failedExit == 0) return firstError;
+  return "curl exit code " + std::to_string(failedExit) +
+         (toolError.empty() ? "" : ", \"" + toolError + "\"");
 }
 
 std::map<int32_t, std::string> ProfileNames(const std::string& configuration) {

@@ -61,6 +61,11 @@ struct RunTally {
 
 RunTally TallyRun(const RunReport& report);
 
+// Why a delivery failed, from the module's log: the transfer tool's exit code
+// and its last error line when the tool ran and failed, otherwise the
+// module's first error line. Empty when the log tells neither.
+std::string DeliveryFailureReason(const RunReport& report);
+
 // Profile number -> description, from a configuration document the module
 // posted. Empty for a text that is not one.
 std::map<int32_t, std::string> ProfileNames(const std::string& configuration);
