@@ -5,85 +5,108 @@
 // binary contract: every offset below is checked with static_assert, and the
 // bytes not named here belong to the host. The records are plain data; any
 // thread may fill or read them.
+//
+// A host written in C (C11) includes it too: the records and constants keep
+// their names, without the namespace (the constants are enumerators there),
+// and MakeHostRequest is for C++ only.
 #ifndef ALERTMOD_HOST_RECORDS_H_
 #define ALERTMOD_HOST_RECORDS_H_
 
+#ifdef __cplusplus
 #include <cstddef>
 #include <cstdint>
+#define ALERTMOD_CONSTANT(type, name, value) constexpr type name = value
+#else
+#include <assert.h>
+#include <stddef.h>
+#include <stdint.h>
+#define ALERTMOD_CONSTANT(type, name, value) enum { name = value }
+typedef struct HostRequest HostRequest;
+typedef struct LoadParmsIn LoadParmsIn;
+typedef struct LoadParmsOut LoadParmsOut;
+typedef struct WriteParmsIn WriteParmsIn;
+typedef struct WriteParmsOut WriteParmsOut;
+typedef struct ReadParmsIn ReadParmsIn;
+typedef struct IoctlParmsIn IoctlParmsIn;
+typedef struct ProcessMessageHeader ProcessMessageHeader;
+#endif
 
+#ifdef __cplusplus
 namespace hx {
 namespace core {
 
 struct HostRequest;
+#endif
 
 // The host's request function. Result 0 means success; for the log-level query
 // it is the host's current threshold. The module always passes 0 as `reserved`.
-using HostCallbackFn = int32_t (*)(HostRequest* request, void* reserved);
+typedef int32_t (*HostCallbackFn)(HostRequest* request, void* reserved);
 
 // Identifies the alert module in every request, log record and document.
-constexpr uint32_t kModuleId = 0xC0000;
+ALERTMOD_CONSTANT(uint32_t, kModuleId, 0xC0000);
 // Source identifier under which the clip writer logs.
-constexpr uint32_t kClipWriterLogSource = 0x390000;
+ALERTMOD_CONSTANT(uint32_t, kClipWriterLogSource, 0x390000);
 
 // Request classes of HostRequest::requestClass.
-constexpr uint32_t kClassProfileStatus = 0x4;
-constexpr uint32_t kClassWatchdogTick = 0x20;
-constexpr uint32_t kClassLog = 0x40;
-constexpr uint32_t kClassDocument = 0x100;
-constexpr uint32_t kClassFrameRelease = 0x200;
-constexpr uint32_t kClassProcess = 0x2000;
-constexpr uint32_t kClassCrypto = 0x8000;
+ALERTMOD_CONSTANT(uint32_t, kClassProfileStatus, 0x4);
+ALERTMOD_CONSTANT(uint32_t, kClassWatchdogTick, 0x20);
+ALERTMOD_CONSTANT(uint32_t, kClassLog, 0x40);
+ALERTMOD_CONSTANT(uint32_t, kClassDocument, 0x100);
+ALERTMOD_CONSTANT(uint32_t, kClassFrameRelease, 0x200);
+ALERTMOD_CONSTANT(uint32_t, kClassProcess, 0x2000);
+ALERTMOD_CONSTANT(uint32_t, kClassCrypto, 0x8000);
 
 // Request codes of HostRequest::code.
-constexpr uint32_t kCodeDocument = 0x01000010;  // classes 4 and 0x100
-constexpr uint32_t kCodeTick = 0x01000000;
-constexpr uint32_t kCodeLogLevelQuery = 0x01000001;
-constexpr uint32_t kCodeLogWrite = 0x01000002;
-constexpr uint32_t kCodeEncrypt = 0x01000002;
-constexpr uint32_t kCodeDecrypt = 0x01000400;
+ALERTMOD_CONSTANT(uint32_t, kCodeDocument, 0x01000010);  // classes 4 and 0x100
+ALERTMOD_CONSTANT(uint32_t, kCodeTick, 0x01000000);
+ALERTMOD_CONSTANT(uint32_t, kCodeLogLevelQuery, 0x01000001);
+ALERTMOD_CONSTANT(uint32_t, kCodeLogWrite, 0x01000002);
+ALERTMOD_CONSTANT(uint32_t, kCodeEncrypt, 0x01000002);
+ALERTMOD_CONSTANT(uint32_t, kCodeDecrypt, 0x01000400);
 
 // Write classes of WriteParmsIn::requestClass.
-constexpr uint32_t kWriteClassFrame = 1;
-constexpr uint32_t kWriteClassTick = 32;
+ALERTMOD_CONSTANT(uint32_t, kWriteClassFrame, 1);
+ALERTMOD_CONSTANT(uint32_t, kWriteClassTick, 32);
 
 // IOCTL control codes of IoctlParmsIn::code.
-constexpr uint32_t kIoctlRunWorker = 1;
-constexpr uint32_t kIoctlHostDocument = 2;
-constexpr uint32_t kIoctlProcessMessage = 4;
+ALERTMOD_CONSTANT(uint32_t, kIoctlRunWorker, 1);
+ALERTMOD_CONSTANT(uint32_t, kIoctlHostDocument, 2);
+ALERTMOD_CONSTANT(uint32_t, kIoctlProcessMessage, 4);
 
 // ReadParmsIn::mode that runs the watchdog loop.
-constexpr uint32_t kReadModeWatchdog = 0;
+ALERTMOD_CONSTANT(uint32_t, kReadModeWatchdog, 0);
 
 // Frame type of a key frame (WriteParmsIn::frameType).
-constexpr uint8_t kFrameTypeKey = 1;
+ALERTMOD_CONSTANT(uint8_t, kFrameTypeKey, 1);
 
 // Constants written into LoadParmsOut.
-constexpr uint32_t kCapabilityWord1 = 0x0200006C;
-constexpr uint32_t kCapabilityWord2 = 0x02000010;
-constexpr uint32_t kCapabilityWord3 = 0x02000000;
+ALERTMOD_CONSTANT(uint32_t, kCapabilityWord1, 0x0200006C);
+ALERTMOD_CONSTANT(uint32_t, kCapabilityWord2, 0x02000010);
+ALERTMOD_CONSTANT(uint32_t, kCapabilityWord3, 0x02000000);
 
 // Values of the class-specific header of log and crypto requests.
-constexpr uint32_t kRequestExtSize = 152;
-constexpr uint32_t kRequestExtVersion = 1;
+ALERTMOD_CONSTANT(uint32_t, kRequestExtSize, 152);
+ALERTMOD_CONSTANT(uint32_t, kRequestExtVersion, 1);
 
-constexpr uint32_t kHostRequestSize = 192;
-constexpr uint32_t kHostRequestVersion = 1;
+ALERTMOD_CONSTANT(uint32_t, kHostRequestSize, 192);
+ALERTMOD_CONSTANT(uint32_t, kHostRequestVersion, 1);
 
 // Process-service messages (request class 0x2000 and IOCTL code 4): a
 // ProcessMessageHeader, then the payload; at most 65536 bytes in all.
-constexpr uint32_t kProcessMessageMaxBytes = 65536;
+ALERTMOD_CONSTANT(uint32_t, kProcessMessageMaxBytes, 65536);
 // Message types: module to host.
-constexpr uint32_t kProcessInput = 0;  // standard input; one shorter than the maximum ends it
-constexpr uint32_t kProcessStart = 6;  // value: start flags; payload: the command
+ALERTMOD_CONSTANT(uint32_t, kProcessInput,
+                  0);  // standard input; one shorter than the maximum ends it
+ALERTMOD_CONSTANT(uint32_t, kProcessStart, 6);  // value: start flags; payload: the command
 // Message types: host to module.
-constexpr uint32_t kProcessOutput = 1;
-constexpr uint32_t kProcessErrorOutput = 2;
-constexpr uint32_t kProcessRunning = 3;
-constexpr uint32_t kProcessFailed = 4;
-constexpr uint32_t kProcessExited = 5;  // value: the exit code
+ALERTMOD_CONSTANT(uint32_t, kProcessOutput, 1);
+ALERTMOD_CONSTANT(uint32_t, kProcessErrorOutput, 2);
+ALERTMOD_CONSTANT(uint32_t, kProcessRunning, 3);
+ALERTMOD_CONSTANT(uint32_t, kProcessFailed, 4);
+ALERTMOD_CONSTANT(uint32_t, kProcessExited, 5);  // value: the exit code
 // Start flags that put optional texts before the program.
-constexpr uint32_t kProcessFlagFirstText = 8;
-constexpr uint32_t kProcessFlagSecondText = 16;
+ALERTMOD_CONSTANT(uint32_t, kProcessFlagFirstText, 8);
+ALERTMOD_CONSTANT(uint32_t, kProcessFlagSecondText, 16);
 
 // Host to module, read by Load.
 struct LoadParmsIn {
@@ -154,7 +177,7 @@ struct ProcessMessageHeader {
   uint32_t type;
   uint32_t value;  // start flags, 1 for input, or the host's status
 };
-constexpr uint32_t kProcessHeaderBytes = sizeof(ProcessMessageHeader);
+ALERTMOD_CONSTANT(uint32_t, kProcessHeaderBytes, 16);
 
 // Module to host: every request the module makes. Zero-filled before use.
 struct HostRequest {
@@ -173,6 +196,7 @@ struct HostRequest {
   uint8_t extRest[0x8C];  // 0x34 to 0xBF
 };
 
+#ifdef __cplusplus
 // Returns a zero-filled request with size, version, requester, class and code set.
 inline HostRequest MakeHostRequest(uint32_t requester, uint32_t requestClass, uint32_t code) {
   HostRequest request{};
@@ -183,6 +207,7 @@ inline HostRequest MakeHostRequest(uint32_t requester, uint32_t requestClass, ui
   request.code = code;
   return request;
 }
+#endif
 
 static_assert(offsetof(LoadParmsIn, callback) == 0x10, "LoadParmsIn layout");
 static_assert(offsetof(LoadParmsOut, moduleId) == 0x08, "LoadParmsOut layout");
@@ -216,22 +241,37 @@ static_assert(sizeof(HostRequest) == kHostRequestSize, "HostRequest is 192 bytes
 static_assert(offsetof(ProcessMessageHeader, id) == 0x04, "ProcessMessageHeader layout");
 static_assert(offsetof(ProcessMessageHeader, type) == 0x08, "ProcessMessageHeader layout");
 static_assert(offsetof(ProcessMessageHeader, value) == 0x0C, "ProcessMessageHeader layout");
-static_assert(sizeof(ProcessMessageHeader) == 16, "ProcessMessageHeader is 16 bytes");
+static_assert(sizeof(ProcessMessageHeader) == kProcessHeaderBytes,
+              "ProcessMessageHeader is 16 bytes");
 
+#undef ALERTMOD_CONSTANT
+
+#ifdef __cplusplus
 }  // namespace core
 }  // namespace hx
+#define ALERTMOD_RECORD(name) hx::core::name
+#else
+#define ALERTMOD_RECORD(name) name
+#endif
 
 #define ALERTMOD_EXPORT __attribute__((visibility("default")))
 
 // The seven entry points, with C linkage. Each returns 0.
+#ifdef __cplusplus
 extern "C" {
-ALERTMOD_EXPORT int32_t Load(hx::core::LoadParmsIn* in, hx::core::LoadParmsOut* out);
-ALERTMOD_EXPORT int32_t Unload();
-ALERTMOD_EXPORT int32_t Open();
-ALERTMOD_EXPORT int32_t Close();
-ALERTMOD_EXPORT int32_t Read(hx::core::ReadParmsIn* in);
-ALERTMOD_EXPORT int32_t Write(hx::core::WriteParmsIn* in, hx::core::WriteParmsOut* out);
-ALERTMOD_EXPORT int32_t IOCTL(hx::core::IoctlParmsIn* in);
+#endif
+ALERTMOD_EXPORT int32_t Load(ALERTMOD_RECORD(LoadParmsIn) * in,
+                             ALERTMOD_RECORD(LoadParmsOut) * out);
+ALERTMOD_EXPORT int32_t Unload(void);
+ALERTMOD_EXPORT int32_t Open(void);
+ALERTMOD_EXPORT int32_t Close(void);
+ALERTMOD_EXPORT int32_t Read(ALERTMOD_RECORD(ReadParmsIn) * in);
+ALERTMOD_EXPORT int32_t Write(ALERTMOD_RECORD(WriteParmsIn) * in,
+                              ALERTMOD_RECORD(WriteParmsOut) * out);
+ALERTMOD_EXPORT int32_t IOCTL(ALERTMOD_RECORD(IoctlParmsIn) * in);
+#ifdef __cplusplus
 }
+#endif
+#undef ALERTMOD_RECORD
 
 #endif  // ALERTMOD_HOST_RECORDS_H_

@@ -245,7 +245,13 @@ std::string DefaultModulePath() {
   const ssize_t n = readlink("/proc/self/exe", exe, sizeof(exe) - 1);
   std::string dir = n > 0 ? std::string(exe, static_cast<size_t>(n)) : std::string(".");
   dir = dir.substr(0, dir.find_last_of('/'));
-  return dir + "/../alertmod/libalertmod.so";
+  const std::string built = dir + "/../alertmod/libalertmod.so";
+#ifdef ALERTMOD_INSTALLED_MODULE
+  // An installed program has no build tree beside it, but the module at the
+  // same place relative to the program (the prefix may have been moved).
+  if (access(built.c_str(), F_OK) != 0) return dir + "/" + ALERTMOD_INSTALLED_MODULE;
+#endif
+  return built;
 }
 
 const char* UsageText() {

@@ -46,7 +46,8 @@ struct CommandLine {
 bool ParseCommandLine(const std::vector<std::string>& words, CommandLine* commandLine,
                       std::string* error);
 
-// The module built beside this program.
+// The module built beside this program or, for an installed program, the
+// module installed with it.
 std::string DefaultModulePath();
 
 // The text of --help.
