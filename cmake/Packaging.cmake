@@ -54,18 +54,20 @@ install(CODE "
                  \"${CMAKE_CURRENT_BINARY_DIR}/alertmod.pc\" @ONLY)")
 install(FILES ${CMAKE_CURRENT_BINARY_DIR}/alertmod.pc DESTINATION ${ALERTMOD_LIBDIR}/pkgconfig)
 
-# Debian wants the changelog and manual pages compressed, without a time stamp.
+# Debian wants the changelog and manual pages compressed, without a time
+# stamp. The package is native (its version has no Debian revision), so its
+# changelog is changelog.gz.
 function(alertmod_gzip file)
   execute_process(COMMAND gzip -9 -n -f -k ${file} RESULT_VARIABLE result)
   if(NOT result EQUAL 0)
     message(FATAL_ERROR "gzip could not compress ${file}")
   endif()
 endfunction()
-set(changelog ${CMAKE_CURRENT_BINARY_DIR}/changelog.Debian)
+set(changelog ${CMAKE_CURRENT_BINARY_DIR}/debian/changelog)
 configure_file(packaging/debian/changelog.in ${changelog} @ONLY)
 alertmod_gzip(${changelog})
 install(FILES ${changelog}.gz DESTINATION ${ALERTMOD_DOC_DIR})
-set(manual ${CMAKE_CURRENT_BINARY_DIR}/alertmod-host.1)
+set(manual ${CMAKE_CURRENT_BINARY_DIR}/debian/alertmod-host.1)
 configure_file(packaging/debian/alertmod-host.1 ${manual} COPYONLY)
 alertmod_gzip(${manual})
 install(FILES ${manual}.gz DESTINATION ${CMAKE_INSTALL_MANDIR}/man1)
