@@ -208,11 +208,24 @@ bool NestingWalk::SkipDeclaration() {
   return false;
 }
 
+// TinyXML's UTF-8 mode skips U+FEFF, U+FFFE and U+FFFF wherever it skips
+// white space, so such a character at the start of a value would vanish: a
+// recipient list holding only one, read back from notify.xml, would lose
+// its profile.
+bool HasSkippedMark(const std::string& text) {
+  static const char* const kMarks[] = {"\xEF\xBB\xBF", "\xEF\xBF\xBE", "\xEF\xBF\xBF"};
+  for (const char* mark : kMarks) {
+    if (text.find(mark) != std::string::npos) return true;
+  }
+  return false;
+}
+
 // TinyXML's own choice for a text (TIXML_DEFAULT_ENCODING: a byte order mark
 // means UTF-8, and so does a declaration naming no encoding or UTF-8), except
-// that a text which is not UTF-8 is read byte by byte.
+// that a text which is not UTF-8, or holds a mark that mode skips, is read
+// byte by byte.
 TiXmlEncoding EncodingOf(const std::string& text, bool byteOrderMark) {
-  if (!IsValidUtf8(text)) return TIXML_ENCODING_LEGACY;
+  if (!IsValidUtf8(text) || HasSkippedMark(text)) return TIXML_ENCODING_LEGACY;
   return byteOrderMark ? TIXML_ENCODING_UTF8 : TIXML_DEFAULT_ENCODING;
 }
 

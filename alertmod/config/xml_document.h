@@ -16,7 +16,9 @@
 // character references without a declaration. A text that is not valid
 // UTF-8 is read in the single-byte mode all the same: TinyXML's UTF-8 mode
 // takes a malformed lead byte together with the bytes after it, which could
-// shift its reading away from the walk or past the end of the text.
+// shift its reading away from the walk or past the end of the text. So is a
+// text holding U+FEFF, U+FFFE or U+FFFF after its byte order mark, which
+// that mode drops from the start of a value.
 //
 // Pure functions; any thread.
 #ifndef ALERTMOD_CONFIG_XML_DOCUMENT_H_

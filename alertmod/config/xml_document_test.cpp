@@ -88,6 +88,9 @@ TEST(XmlDocumentTest, ParsesHostDocumentsByteForByte) {
   const TiXmlElement* input = document.RootElement()->FirstChildElement("Input");
   ASSERT_NE(input, nullptr);
   EXPECT_STREQ(input->Attribute("Name"), "Caf\xC3\xA9 & Bar");
+  // The UTF-8 mode would drop a byte order mark at the start of a value.
+  ASSERT_TRUE(ParseXmlDocument("<?xml ?><a><to>\xEF\xBB\xBF</to></a>", document));
+  EXPECT_STREQ(document.RootElement()->FirstChildElement("to")->GetText(), "\xEF\xBB\xBF");
 }
 
 TEST(XmlDocumentTest, ReportsParseErrorsWithoutNodes) {
