@@ -6,7 +6,7 @@
 #include <cstring>
 #include <vector>
 
-#include "alertmod/config/base64.h"
+#include "alertmod/util/base64.h"
 #include "host/password_service.h"
 #include "tests/support/fake_host.h"
 #include "tests/support/temp_dir.h"

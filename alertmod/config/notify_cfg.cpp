@@ -6,7 +6,7 @@
 
 #include <tinyxml.h>
 
-#include "alertmod/config/base64.h"
+#include "alertmod/util/base64.h"
 #include "alertmod/config/module_replies.h"
 #include "alertmod/config/xml_attr.h"
 

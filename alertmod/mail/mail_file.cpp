@@ -6,7 +6,7 @@
 #include <mutex>
 #include <regex>
 
-#include "alertmod/config/base64.h"
+#include "alertmod/util/base64.h"
 #include "alertmod/diag/log.h"
 #include "alertmod/mail/notify_file.h"
 #include "alertmod/platform/clock.h"

@@ -4,7 +4,7 @@
 #include <exception>
 #include <limits>
 
-#include "alertmod/config/base64.h"
+#include "alertmod/util/base64.h"
 #include "alertmod/diag/log.h"
 #include "alertmod/weblink/http_get_client.h"
 #include "alertmod/weblink/login_reply.h"

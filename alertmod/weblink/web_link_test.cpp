@@ -2,7 +2,7 @@
 
 #include <gtest/gtest.h>
 
-#include "alertmod/config/base64.h"
+#include "alertmod/util/base64.h"
 #include "alertmod/diag/log.h"
 #include "alertmod/weblink/http_get_client.h"
 #include "tests/support/fake_host.h"

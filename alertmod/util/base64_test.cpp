@@ -1,4 +1,4 @@
-#include "alertmod/config/base64.h"
+#include "alertmod/util/base64.h"
 
 #include <gtest/gtest.h>
 

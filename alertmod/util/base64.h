@@ -1,8 +1,8 @@
 // The module's one Base64: the standard alphabet with "=" padding and no line
 // breaks, and a lenient decoder that skips everything outside the alphabet.
 // Pure functions; any thread.
-#ifndef ALERTMOD_CONFIG_BASE64_H_
-#define ALERTMOD_CONFIG_BASE64_H_
+#ifndef ALERTMOD_UTIL_BASE64_H_
+#define ALERTMOD_UTIL_BASE64_H_
 
 #include <cstddef>
 #include <cstdint>
@@ -29,4 +29,4 @@ std::string Base64Decode(const std::string& text);
 
 }  // namespace hx
 
-#endif  // ALERTMOD_CONFIG_BASE64_H_
+#endif  // ALERTMOD_UTIL_BASE64_H_
