@@ -1,6 +1,7 @@
 #include "alertmod/mail/notify_helper.h"
 
 #include "alertmod/hostsvc/process_service.h"
+#include "alertmod/mail/smtp_delivery.h"
 
 namespace hx {
 
@@ -10,6 +11,10 @@ NotifyHelper::~NotifyHelper() = default;
 
 void NotifyHelper::ReportStatus(int32_t profileId, int32_t status) {
   ReportProfileStatus(m_statusDocument, profileId, status, m_callback);
+}
+
+DeliveryResult NotifyHelper::Deliver(const MailFile& mail, const std::vector<SmtpServer>& servers) {
+  return DeliverMailFile(mail, servers, *this);
 }
 
 bool NotifyHelper::RunProcess(const std::vector<std::string>& arguments, const std::string& input,

@@ -1,7 +1,7 @@
 // NotifyHelper carries what the notification job keeps between work items:
-// the profile status document it reports with, and the retry queue. Its two
-// virtual operations are the job's seams to the host: status reports and
-// program runs (the transfer tool).
+// the profile status document it reports with, and the retry queue, which it
+// serves as the queue's RetryDelivery. Its virtual operations are the job's
+// seams to the host: status reports and program runs (the transfer tool).
 //
 // The worker creates one when it starts, after clearing the data directory,
 // and is its only user.
@@ -18,16 +18,16 @@
 
 namespace hx {
 
-class NotifyHelper {
+class NotifyHelper : public RetryDelivery {
  public:
   explicit NotifyHelper(core::HostCallbackFn callback);
-  virtual ~NotifyHelper();
+  ~NotifyHelper() override;
 
   NotifyHelper(const NotifyHelper&) = delete;
   NotifyHelper& operator=(const NotifyHelper&) = delete;
 
   // Tells the host the delivery status of a profile: 0 all sent, 1 otherwise.
-  virtual void ReportStatus(int32_t profileId, int32_t status);
+  void ReportStatus(int32_t profileId, int32_t status) override;
 
   // Runs `arguments` through the host's process service with `input` on its
   // standard input; collects the exit code and the error output's lines.
@@ -35,7 +35,10 @@ class NotifyHelper {
   virtual bool RunProcess(const std::vector<std::string>& arguments, const std::string& input,
                           int32_t& exitCode, std::vector<std::string>& errorLines);
 
-  core::HostCallbackFn Callback() const { return m_callback; }
+  // Delivers through DeliverMailFile, so through RunProcess.
+  DeliveryResult Deliver(const MailFile& mail, const std::vector<SmtpServer>& servers) override;
+
+  core::HostCallbackFn Callback() const override { return m_callback; }
   RetryQueue& Retries() { return m_retries; }
 
  private:

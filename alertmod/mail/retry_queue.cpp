@@ -3,8 +3,6 @@
 #include <cinttypes>
 
 #include "alertmod/diag/log.h"
-#include "alertmod/mail/notify_helper.h"
-#include "alertmod/mail/smtp_delivery.h"
 #include "alertmod/platform/clock.h"
 
 namespace hx {
@@ -31,22 +29,22 @@ void RetryQueue::Remove(std::deque<Entry>::iterator entry, INotifyFileStream& st
   m_queue.erase(entry);
 }
 
-void RetryQueue::DropOldestForLimit(NotifyHelper& helper, int32_t maxRetryQueue,
+void RetryQueue::DropOldestForLimit(RetryDelivery& delivery, int32_t maxRetryQueue,
                                     INotifyFileStream& stream) {
   if (m_queue.empty() || static_cast<int64_t>(m_queue.size()) < maxRetryQueue) return;
-  LogToHost(core::kModuleId, helper.Callback(), LogLevelInfo,
+  LogToHost(core::kModuleId, delivery.Callback(), LogLevelInfo,
             "Maximum failed message queue limit of %d is exceeded.", maxRetryQueue);
-  LogToHost(core::kModuleId, helper.Callback(), LogLevelInfo,
+  LogToHost(core::kModuleId, delivery.Callback(), LogLevelInfo,
             "Message for profile %s will be discarded",
             m_queue.front().mail.profileDescription.c_str());
   Remove(m_queue.begin(), stream);
 }
 
-bool RetryQueue::MakeRoom(NotifyHelper& helper, INotifyFileStream& stream) {
+bool RetryQueue::MakeRoom(RetryDelivery& delivery, INotifyFileStream& stream) {
   const std::string directory = DataDirectory();
   uint64_t freeBytes = stream.FreeBytes(directory);
   if (freeBytes >= kFreeSpaceFloorBytes) return true;
-  LogToHost(core::kModuleId, helper.Callback(), LogLevelInfo,
+  LogToHost(core::kModuleId, delivery.Callback(), LogLevelInfo,
             "Available bytes %" PRIu64
             " are less than threshold of %u. Attempting to purge failed notifications",
             freeBytes, static_cast<unsigned>(kFreeSpaceFloorBytes));
@@ -56,7 +54,7 @@ bool RetryQueue::MakeRoom(NotifyHelper& helper, INotifyFileStream& stream) {
       ++entry;
       continue;
     }
-    LogToHost(core::kModuleId, helper.Callback(), LogLevelInfo,
+    LogToHost(core::kModuleId, delivery.Callback(), LogLevelInfo,
               "Minimum free space threshold exceeded. Message for profile %s (%s) will be "
               "discarded",
               entry->mail.profileDescription.c_str(), entry->mail.path.c_str());
@@ -67,12 +65,12 @@ bool RetryQueue::MakeRoom(NotifyHelper& helper, INotifyFileStream& stream) {
   return stream.FreeBytes(directory) >= kFreeSpaceFloorBytes;
 }
 
-void RetryQueue::Enqueue(NotifyHelper& helper, const MailFile& mail,
+void RetryQueue::Enqueue(RetryDelivery& delivery, const MailFile& mail,
                          const std::vector<SmtpServer>& servers, int32_t maxRetryQueue,
                          INotifyFileStream& stream) {
-  DropOldestForLimit(helper, maxRetryQueue, stream);
-  if (!MakeRoom(helper, stream)) {
-    LogToHost(core::kModuleId, helper.Callback(), LogLevelWarning,
+  DropOldestForLimit(delivery, maxRetryQueue, stream);
+  if (!MakeRoom(delivery, stream)) {
+    LogToHost(core::kModuleId, delivery.Callback(), LogLevelWarning,
               "Unable to free up space by removing items from notification retry queue. Message "
               "(%s) for profile %s will be discarded",
               mail.path.c_str(), mail.profileDescription.c_str());
@@ -90,7 +88,7 @@ void RetryQueue::Enqueue(NotifyHelper& helper, const MailFile& mail,
   ++m_sequence;
 }
 
-void RetryQueue::RetryPass(NotifyHelper& helper, INotifyFileStream& stream,
+void RetryQueue::RetryPass(RetryDelivery& delivery, INotifyFileStream& stream,
                            int32_t maxRetrySeconds) {
   if (m_queue.empty()) return;
   uint64_t now = Now();
@@ -105,19 +103,19 @@ void RetryQueue::RetryPass(NotifyHelper& helper, INotifyFileStream& stream,
     return;
   }
   entry->mail.lastAttempt = tick;
-  LogToHost(core::kModuleId, helper.Callback(), LogLevelInfo,
+  LogToHost(core::kModuleId, delivery.Callback(), LogLevelInfo,
             "Retrying failed notification for file %s", entry->mail.path.c_str());
-  DeliveryResult result = DeliverMailFile(entry->mail, entry->mail.servers, helper);
+  DeliveryResult result = delivery.Deliver(entry->mail, entry->mail.servers);
   if (result == kDeliveryRetryable &&
       static_cast<int64_t>(now - entry->firstFailureMs) < int64_t{maxRetrySeconds} * 1000) {
     return;
   }
   if (result == kDeliverySent) {
-    LogToHost(core::kModuleId, helper.Callback(), LogLevelInfo,
+    LogToHost(core::kModuleId, delivery.Callback(), LogLevelInfo,
               "Retry for notification file (%s) suceeded.", entry->mail.path.c_str());
-    helper.ReportStatus(static_cast<int32_t>(entry->mail.profileId), 0);
+    delivery.ReportStatus(static_cast<int32_t>(entry->mail.profileId), 0);
   } else {
-    LogToHost(core::kModuleId, helper.Callback(), LogLevelInfo,
+    LogToHost(core::kModuleId, delivery.Callback(), LogLevelInfo,
               "Retry timeout reached for notification file (%s).  Message for profile %s will be "
               "discarded",
               entry->mail.path.c_str(), entry->mail.profileDescription.c_str());
@@ -126,9 +124,9 @@ void RetryQueue::RetryPass(NotifyHelper& helper, INotifyFileStream& stream,
   Remove(entry, stream);
 }
 
-void RetryQueue::Clear(NotifyHelper& helper, INotifyFileStream& stream) {
+void RetryQueue::Clear(RetryDelivery& delivery, INotifyFileStream& stream) {
   if (m_queue.empty()) return;
-  LogToHost(core::kModuleId, helper.Callback(), LogLevelInfo,
+  LogToHost(core::kModuleId, delivery.Callback(), LogLevelInfo,
             "Clearing retry notifications queue. %d failed notifications will be discarded",
             static_cast<int>(m_queue.size()));
   for (const Entry& entry : m_queue) stream.RemoveFile(entry.mail.path);

@@ -6,7 +6,9 @@
 //
 // The queue lives in memory only; its message files live in the data
 // directory. Only the manager's worker thread touches a RetryQueue (through
-// its NotifyHelper); it takes no lock.
+// its NotifyHelper); it takes no lock. The queue reaches delivery, status
+// reports and the log only through RetryDelivery, which the notification job
+// implements.
 #ifndef ALERTMOD_MAIL_RETRY_QUEUE_H_
 #define ALERTMOD_MAIL_RETRY_QUEUE_H_
 
@@ -15,12 +17,27 @@
 #include <vector>
 
 #include "alertmod/config/notify_types.h"
+#include "alertmod/host_records.h"
 #include "alertmod/mail/mail_file.h"
 #include "alertmod/mail/notify_file_stream.h"
+#include "alertmod/mail/smtp_delivery.h"
 
 namespace hx {
 
-class NotifyHelper;
+// What the queue needs of the notification job to retry its messages.
+class RetryDelivery {
+ public:
+  virtual ~RetryDelivery() = default;
+
+  // The host callback the queue logs through.
+  virtual core::HostCallbackFn Callback() const = 0;
+
+  // Tries `servers` in order until one takes `mail`, as DeliverMailFile does.
+  virtual DeliveryResult Deliver(const MailFile& mail, const std::vector<SmtpServer>& servers) = 0;
+
+  // Tells the host the delivery status of a profile: 0 all sent, 1 otherwise.
+  virtual void ReportStatus(int32_t profileId, int32_t status) = 0;
+};
 
 // Below this many free bytes on the data volume, queued messages are purged.
 constexpr uint64_t kFreeSpaceFloorBytes = 104857600;
@@ -46,16 +63,17 @@ class RetryQueue {
   // old messages are purged while the data volume is below its floor; each
   // discard is logged and its file removed. When the floor cannot be reached,
   // `mail` itself is discarded and its file removed.
-  void Enqueue(NotifyHelper& helper, const MailFile& mail, const std::vector<SmtpServer>& servers,
-               int32_t maxRetryQueue, INotifyFileStream& stream);
+  void Enqueue(RetryDelivery& delivery, const MailFile& mail,
+               const std::vector<SmtpServer>& servers, int32_t maxRetryQueue,
+               INotifyFileStream& stream);
 
   // Retries at most one message when its cycle is due. A message that is
   // sent, fails for good, or has failed for `maxRetrySeconds` or longer
   // leaves the queue with its file; a sent one is reported with status 0.
-  void RetryPass(NotifyHelper& helper, INotifyFileStream& stream, int32_t maxRetrySeconds);
+  void RetryPass(RetryDelivery& delivery, INotifyFileStream& stream, int32_t maxRetrySeconds);
 
   // Discards every queued message and its file (the configuration changed).
-  void Clear(NotifyHelper& helper, INotifyFileStream& stream);
+  void Clear(RetryDelivery& delivery, INotifyFileStream& stream);
 
   // The tick at which the next cycle may begin, and the current interval.
   uint32_t NextRetry() const { return m_nextRetry; }
@@ -68,8 +86,9 @@ class RetryQueue {
   };
 
   uint64_t Now();
-  void DropOldestForLimit(NotifyHelper& helper, int32_t maxRetryQueue, INotifyFileStream& stream);
-  bool MakeRoom(NotifyHelper& helper, INotifyFileStream& stream);
+  void DropOldestForLimit(RetryDelivery& delivery, int32_t maxRetryQueue,
+                          INotifyFileStream& stream);
+  bool MakeRoom(RetryDelivery& delivery, INotifyFileStream& stream);
   void Remove(std::deque<Entry>::iterator entry, INotifyFileStream& stream);
 
   uint32_t m_sequence = 0;
