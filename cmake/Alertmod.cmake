@@ -1,20 +1,19 @@
 # Helpers that register tests. In a TSan build only tests marked THREADED are
 # built and registered, which keeps that build short.
 
-# alertmod_unit_tests(<library> [THREADED] [LIBS ...])
-# Builds every *_test.cpp beside the caller into <library>_test, linked with
+# alertmod_unit_tests(<library> TESTS ... [THREADED] [LIBS ...])
+# Builds the TESTS sources (beside the caller) into <library>_test, linked with
 # <library> and GoogleMock, and registers each test case with CTest.
 function(alertmod_unit_tests library)
-  cmake_parse_arguments(ARG "THREADED" "" "LIBS" ${ARGN})
+  cmake_parse_arguments(ARG "THREADED" "" "TESTS;LIBS" ${ARGN})
   if(ALERTMOD_SANITIZE STREQUAL "thread" AND NOT ARG_THREADED)
     return()
   endif()
-  file(GLOB sources CONFIGURE_DEPENDS ${CMAKE_CURRENT_SOURCE_DIR}/*_test.cpp)
-  if(NOT sources)
+  if(NOT ARG_TESTS)
     return()
   endif()
   set(target ${library}_test)
-  add_executable(${target} ${sources})
+  add_executable(${target} ${ARG_TESTS})
   target_link_libraries(${target} PRIVATE ${library} ${ARG_LIBS} alertmod_test_support_unit
                         GTest::gmock GTest::gtest_main Threads::Threads)
   set(labels unit)
@@ -44,31 +43,25 @@ function(alertmod_integration_test name)
                        PROPERTIES LABELS "${labels}" TIMEOUT 300)
 endfunction()
 
-# alertmod_subsystem(<library> DEPS ... [THREADED])
-# A subsystem's static library from every .cpp beside the caller that is not
-# a test, and its unit tests. A subsystem without sources yet is an interface
-# library.
+# alertmod_subsystem(<library> SOURCES ... [TESTS ...] [TEST_LIBS ...]
+#                    [DEPS ...] [THREADED])
+# A subsystem's static library from its SOURCES, and its unit tests from its
+# TESTS, linked also with TEST_LIBS. DEPS names exactly the libraries whose headers the sources include;
+# scripts/check-layering keeps those includes pointing down the layers.
 function(alertmod_subsystem library)
-  cmake_parse_arguments(ARG "THREADED" "" "DEPS" ${ARGN})
-  file(GLOB sources CONFIGURE_DEPENDS ${CMAKE_CURRENT_SOURCE_DIR}/*.cpp)
-  list(FILTER sources EXCLUDE REGEX "_test\\.cpp$")
-  if(sources)
-    add_library(${library} STATIC ${sources})
-    target_include_directories(${library} PUBLIC ${PROJECT_SOURCE_DIR})
-    target_link_libraries(${library} PUBLIC ${ARG_DEPS})
-  else()
-    add_library(${library} INTERFACE)
-    target_include_directories(${library} INTERFACE ${PROJECT_SOURCE_DIR})
-    target_link_libraries(${library} INTERFACE ${ARG_DEPS})
-  endif()
-  if(ALERTMOD_FUZZ AND sources)
+  cmake_parse_arguments(ARG "THREADED" "" "SOURCES;TESTS;TEST_LIBS;DEPS" ${ARGN})
+  add_library(${library} STATIC ${ARG_SOURCES})
+  # Sources name headers from the project root ("alertmod/<subsystem>/...").
+  target_include_directories(${library} PUBLIC ${PROJECT_SOURCE_DIR})
+  target_link_libraries(${library} PUBLIC ${ARG_DEPS})
+  if(ALERTMOD_FUZZ)
     # Coverage feedback for the fuzz targets that link this library.
     target_compile_options(${library} PRIVATE -fsanitize=fuzzer-no-link)
   endif()
   if(ARG_THREADED)
-    alertmod_unit_tests(${library} THREADED)
+    alertmod_unit_tests(${library} THREADED TESTS ${ARG_TESTS} LIBS ${ARG_TEST_LIBS})
   else()
-    alertmod_unit_tests(${library})
+    alertmod_unit_tests(${library} TESTS ${ARG_TESTS} LIBS ${ARG_TEST_LIBS})
   endif()
 endfunction()
 

@@ -58,7 +58,7 @@ TEST(CredentialsTest, RequestsCarryTheMarkedInput) {
     EXPECT_EQ(result, c.result) << c.input;
     auto requests = host.Requests().OfClass(kClassCrypto);
     ASSERT_EQ(requests.size(), 1u);
-    const refhost::RecordedRequest& request = requests[0];
+    const testsupport::RecordedRequest& request = requests[0];
     EXPECT_EQ(request.code, c.encrypt ? 0x01000002u : 0x01000400u);
     EXPECT_EQ(request.requester, kModuleId);
     EXPECT_EQ(request.length, c.bufferLength);

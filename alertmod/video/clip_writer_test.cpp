@@ -32,7 +32,7 @@ class ClipWriterTest : public ::testing::Test {
   }
 
   bool Logged(uint32_t source, int32_t level, const std::string& text) {
-    for (const refhost::LogLine& line : m_host.Log().Lines()) {
+    for (const testsupport::LogLine& line : m_host.Log().Lines()) {
       if (line.source == source && line.level == level && line.text == text) return true;
     }
     return false;
@@ -216,7 +216,7 @@ TEST_F(ClipWriterTest, FilesThatCannotBeStartedAreLogged) {
   }
   // One line per key frame: each retries the open.
   size_t lines = 0;
-  for (const refhost::LogLine& line : m_host.Log().Lines()) {
+  for (const testsupport::LogLine& line : m_host.Log().Lines()) {
     if (line.source == core::kClipWriterLogSource && line.level == LogLevelError &&
         line.text == "failed to start mp4/mov file for 12: -1") {
       ++lines;
