@@ -6,7 +6,7 @@
 #include <set>
 
 #include "alertmod/config/xml_document.h"
-#include "alertmod/platform/error_text.h"
+#include "alertmod/platform/file_system.h"
 #include "alertmod/platform/files.h"
 
 namespace hx {
@@ -66,22 +66,21 @@ std::atomic<SideFileSyncedHook> g_sideFileSyncedHook{nullptr};
 // device. Returns the error text, empty on success. Only the first failure is
 // reported: a close error after a write error says nothing new.
 std::string WriteSideFile(const std::string& sideName, const std::string& text) {
-  int fd = -1;
-  if (int error = platform::CreateExclusiveFile(sideName, fd)) {
-    return "create error " + std::to_string(error);
-  }
+  platform::File file;
+  platform::Status status = platform::File::CreateNew(sideName, &file);
+  if (!status.ok()) return "create error " + std::to_string(status.code());
   std::string failure;
   size_t written = 0;
-  if (int error = platform::WriteFully(fd, text.data(), text.size(), written)) {
-    failure = "write error " + std::to_string(error);
-  } else if (int error = platform::SyncFile(fd)) {
-    // Data that never reached the device was not written.
-    failure = "write error " + std::to_string(error);
+  status = file.Write(text.data(), text.size(), &written);
+  // Data that never reached the device was not written.
+  if (status.ok()) status = file.Sync();
+  if (!status.ok()) {
+    failure = "write error " + std::to_string(status.code());
   } else if (SideFileSyncedHook hook = g_sideFileSyncedHook.load()) {
     hook(sideName);
   }
-  int closeError = platform::CloseFile(fd);
-  if (failure.empty() && closeError != 0) failure = "close error " + std::to_string(closeError);
+  status = file.Close();
+  if (failure.empty() && !status.ok()) failure = "close error " + std::to_string(status.code());
   if (failure.empty() && written < text.size()) {
     failure =
         "only wrote " + std::to_string(written) + " of " + std::to_string(text.size()) + " bytes";
@@ -112,7 +111,7 @@ std::string NormalizeLineEnds(const std::string& text) {
 bool LoadDocumentFile(TiXmlDocument& document, const std::string& name) {
   std::string text;
   if (!platform::IsRegularFileUpTo(name, kLargestXmlFileBytes)) return false;
-  if (platform::ReadWholeFile(name, &text) != 0) return false;
+  if (!platform::ReadWholeFile(name, &text).ok()) return false;
   return ParseXmlDocument(NormalizeLineEnds(text), document);
 }
 
@@ -145,17 +144,18 @@ bool SaveXmlDurably(const TiXmlDocument& document, const std::string& fileName,
 
   // A side file left by an interrupted save would make the exclusive create
   // fail; it is stale, since the name is ours now.
-  platform::RemoveFile(sideName);
+  platform::DeleteFile(sideName);
   std::string failure = WriteSideFile(sideName, text);
   if (!failure.empty()) {
-    platform::RemoveFile(sideName);
+    platform::DeleteFile(sideName);
     if (errorText != nullptr) *errorText = failure;
     return false;
   }
-  if (int error = platform::RenameReplacing(sideName, fileName)) {
+  platform::Status renamed = platform::RenameReplacing(sideName, fileName);
+  if (!renamed.ok()) {
     if (errorText != nullptr) {
-      *errorText = "Failed to rename .xml.pending to .xml file " + std::to_string(error) + " - " +
-                   platform::ErrorText(error);
+      *errorText = "Failed to rename .xml.pending to .xml file " + std::to_string(renamed.code()) +
+                   " - " + renamed.SystemText();
     }
     return false;
   }
@@ -169,7 +169,7 @@ bool LoadXmlDurably(TiXmlDocument& document, const std::string& fileName) {
   const std::string sideName = fileName + kPendingSuffix;
   FileNameLock held(fileName);
   if (LoadCompleteSideFile(document, sideName)) {
-    if (platform::RenameReplacing(sideName, fileName) == 0) {
+    if (platform::RenameReplacing(sideName, fileName).ok()) {
       platform::SyncParentDirectory(fileName);
     }
     return true;

@@ -73,7 +73,7 @@ class FakeStream final : public INotifyFileStream {
   bool CreateDirectory(const std::string&) override { return true; }
   bool RemoveFile(const std::string& path) override {
     removed.push_back(path);
-    return platform::DeleteFile(path).ok;
+    return platform::DeleteFile(path).ok();
   }
 
   std::deque<uint64_t> freeBytes{uint64_t{1} << 40};

@@ -196,7 +196,7 @@ DataDirectoryCache& TheDataDirectoryCache() {
 
 std::string ComputeDataDirectory() {
   std::string path;
-  if (!platform::AbsolutePath(kDataDirectoryName, &path).ok) path = kDataDirectoryName;
+  if (!platform::AbsolutePath(kDataDirectoryName, &path).ok()) path = kDataDirectoryName;
   return path;
 }
 
@@ -273,16 +273,15 @@ std::string DataDirectory() {
 void ClearDataDirectory(core::HostCallbackFn callback) {
   std::string directory = RefreshDataDirectory();
   std::vector<std::string> names;
-  bool exists = true;
-  platform::FsStatus status = platform::ListRegularFiles(directory, &names, &exists);
-  for (size_t i = 0; status.ok && i < names.size(); ++i) {
+  platform::Status status = platform::ListRegularFiles(directory, &names);
+  for (size_t i = 0; status.ok() && i < names.size(); ++i) {
     if (names[i].compare(0, sizeof(kMailFilePrefix) - 1, kMailFilePrefix) != 0) continue;
     status = platform::DeleteFile(directory + "/" + names[i]);
   }
   // A data directory that does not exist yet has nothing to clear.
-  if (!status.ok && exists) {
+  if (!status.ok() && !status.IsNotFound()) {
     LogToHost(core::kModuleId, callback, LogLevelInfo,
-              "Exception while clearing data subdirectory: %s", status.error.c_str());
+              "Exception while clearing data subdirectory: %s", status.message().c_str());
   }
 }
 

@@ -83,8 +83,7 @@ class NotificationJobTest : public ::testing::Test {
   void Run() { RunNotificationJob(m_item, m_helper, m_stream, 100, m_writer); }
   std::vector<std::string> DataFiles() {
     std::vector<std::string> names;
-    bool exists = false;
-    platform::ListRegularFiles(DataDirectory(), &names, &exists);
+    platform::ListRegularFiles(DataDirectory(), &names);
     return names;
   }
   // The message file handed to the transfer tool in run `run`.

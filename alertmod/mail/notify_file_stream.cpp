@@ -63,21 +63,21 @@ uint64_t NotifyFileStreamImpl::Position() {
 
 uint64_t NotifyFileStreamImpl::FreeBytes(const std::string& directory) {
   uint64_t bytes = 0;
-  platform::FsStatus status = platform::QueryFreeBytes(directory, &bytes);
-  if (!status.ok) {
+  platform::Status status = platform::QueryFreeBytes(directory, &bytes);
+  if (!status.ok()) {
     LogToHost(core::kModuleId, m_callback, LogLevelInfo, "Exception while query volume space: %s",
-              status.error.c_str());
+              status.message().c_str());
     return kUnknownFreeBytes;
   }
   return bytes == UINT64_MAX ? kUnknownFreeBytes : bytes;
 }
 
 bool NotifyFileStreamImpl::CreateDirectory(const std::string& directory) {
-  return platform::MakeDirectory(directory).ok;
+  return platform::MakeDirectory(directory).ok();
 }
 
 bool NotifyFileStreamImpl::RemoveFile(const std::string& path) {
-  return platform::DeleteFile(path).ok;
+  return platform::DeleteFile(path).ok();
 }
 
 }  // namespace hx

@@ -21,11 +21,11 @@ struct FreeSpace {
   uint64_t bytes;
 };
 
-platform::FsStatus ReplacedQuery(void* context, const std::string&, uint64_t* bytes) {
+platform::Status ReplacedQuery(void* context, const std::string&, uint64_t* bytes) {
   const FreeSpace* space = static_cast<const FreeSpace*>(context);
-  if (!space->ok) return platform::FsStatus::Failure("volume gone");
+  if (!space->ok) return platform::Status::Failure("volume gone");
   *bytes = space->bytes;
-  return platform::FsStatus::Success();
+  return platform::Status::OK();
 }
 
 class NotifyFileStreamTest : public ::testing::Test {

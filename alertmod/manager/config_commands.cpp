@@ -2,7 +2,6 @@
 // the configuration after every change, configuration updates from the host
 // and its second reviewer setting. All run on the host threads of Open and
 // IOCTL code 2, one at a time.
-#include <cerrno>
 #include <vector>
 
 #include <tinyxml.h>
@@ -14,7 +13,6 @@
 #include "alertmod/mail/smtp_probe.h"
 #include "alertmod/mail/templates.h"
 #include "alertmod/manager/notify_manager.h"
-#include "alertmod/platform/error_text.h"
 #include "alertmod/platform/files.h"
 
 namespace hx {
@@ -60,16 +58,16 @@ std::vector<int32_t> ProfilesToReset(const NotifyCfg& before, const NotifyCfg& a
 }
 
 void KeepRejectedFile(core::HostCallbackFn callback) {
-  int error = platform::RenameReplacing(kConfigFileName, kRejectedConfigFileName);
-  if (error == ENOENT) return;
-  if (error == 0) {
+  platform::Status status = platform::RenameReplacing(kConfigFileName, kRejectedConfigFileName);
+  if (status.IsNotFound()) return;
+  if (status.ok()) {
     LogToHost(core::kModuleId, callback, LogLevelWarning,
               "The unusable %s was kept as %s before a new one is written.", kConfigFileName,
               kRejectedConfigFileName);
     return;
   }
   LogToHost(core::kModuleId, callback, LogLevelError, "Unable to keep the unusable %s as %s: %s",
-            kConfigFileName, kRejectedConfigFileName, platform::ErrorText(error).c_str());
+            kConfigFileName, kRejectedConfigFileName, status.SystemText().c_str());
 }
 
 const TiXmlElement* SecondReviewerElement(const TiXmlDocument& document) {

@@ -10,9 +10,6 @@
 #include <memory>
 #include <mutex>
 
-#include "alertmod/platform/error_text.h"
-#include "alertmod/platform/files.h"
-
 namespace hx {
 namespace platform {
 namespace {
@@ -30,11 +27,11 @@ FreeBytesSource& TheFreeBytesSource() {
   return source;
 }
 
-FsStatus ErrnoFailure(const char* action, const std::string& path, int error) {
-  return FsStatus::Failure(std::string(action) + " \"" + path + "\": " + ErrorText(error));
+Status ErrnoFailure(const char* action, const std::string& path, int error) {
+  return Status::FromErrno(std::string(action) + " \"" + path + "\"", error);
 }
 
-FsStatus SystemFreeBytes(const std::string& directory, uint64_t* bytes) {
+Status SystemFreeBytes(const std::string& directory, uint64_t* bytes) {
   struct statvfs volume {};
   if (statvfs(directory.c_str(), &volume) != 0) {
     return ErrnoFailure("cannot query the volume of", directory, errno);
@@ -47,7 +44,7 @@ FsStatus SystemFreeBytes(const std::string& directory, uint64_t* bytes) {
     available = UINT64_MAX;
   }
   *bytes = available;
-  return FsStatus::Success();
+  return Status::OK();
 }
 
 bool IsDirectory(const std::string& path) {
@@ -65,36 +62,30 @@ bool IsRegularEntry(const std::string& directory, const dirent& entry) {
 
 }  // namespace
 
-FsStatus AbsolutePath(const std::string& relative, std::string* absolute) {
+Status AbsolutePath(const std::string& relative, std::string* absolute) {
   std::unique_ptr<char, void (*)(void*)> current(getcwd(nullptr, 0), &free);
   if (!current) return ErrnoFailure("cannot read the current directory for", relative, errno);
   std::string base(current.get());
   if (base.empty() || base.back() != '/') base += '/';
   *absolute = base + relative;
-  return FsStatus::Success();
+  return Status::OK();
 }
 
-FsStatus MakeDirectory(const std::string& path) {
-  if (mkdir(path.c_str(), 0777) == 0) return FsStatus::Success();
+Status MakeDirectory(const std::string& path) {
+  if (mkdir(path.c_str(), 0777) == 0) return Status::OK();
   int error = errno;
-  if (error == EEXIST && IsDirectory(path)) return FsStatus::Success();
+  if (error == EEXIST && IsDirectory(path)) return Status::OK();
   return ErrnoFailure("cannot create directory", path, error == EEXIST ? ENOTDIR : error);
 }
 
-FsStatus DeleteFile(const std::string& path) {
-  int error = RemoveFile(path);
-  return error == 0 ? FsStatus::Success() : ErrnoFailure("cannot remove", path, error);
+Status DeleteFile(const std::string& path) {
+  if (unlink(path.c_str()) == 0 || errno == ENOENT) return Status::OK();
+  return ErrnoFailure("cannot remove", path, errno);
 }
 
-FsStatus ListRegularFiles(const std::string& directory, std::vector<std::string>* names,
-                          bool* exists) {
-  *exists = true;
+Status ListRegularFiles(const std::string& directory, std::vector<std::string>* names) {
   std::unique_ptr<DIR, int (*)(DIR*)> dir(opendir(directory.c_str()), &closedir);
-  if (!dir) {
-    int error = errno;
-    *exists = error != ENOENT;
-    return ErrnoFailure("cannot read directory", directory, error);
-  }
+  if (!dir) return ErrnoFailure("cannot read directory", directory, errno);
   names->clear();
   for (;;) {
     errno = 0;
@@ -103,10 +94,10 @@ FsStatus ListRegularFiles(const std::string& directory, std::vector<std::string>
     if (IsRegularEntry(directory, *entry)) names->emplace_back(entry->d_name);
   }
   if (errno != 0) return ErrnoFailure("cannot read directory", directory, errno);
-  return FsStatus::Success();
+  return Status::OK();
 }
 
-FsStatus QueryFreeBytes(const std::string& directory, uint64_t* bytes) {
+Status QueryFreeBytes(const std::string& directory, uint64_t* bytes) {
   FreeBytesSource& source = TheFreeBytesSource();
   FreeBytesQuery query;
   void* context;

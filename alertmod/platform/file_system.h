@@ -1,9 +1,9 @@
 // The directory and volume calls of the message store: absolute paths,
 // directory creation and listing, file removal and the free space of a volume.
 //
-// Every call reports a failure as a value carrying the system's text for it;
-// nothing throws. All calls may be made from any thread. The free-space query
-// is process-wide replaceable so that tests can simulate a full disk.
+// Every call reports a failure as a Status; nothing throws. All calls may be
+// made from any thread. The free-space query is process-wide replaceable so
+// that tests can simulate a full disk.
 #ifndef ALERTMOD_PLATFORM_FILE_SYSTEM_H_
 #define ALERTMOD_PLATFORM_FILE_SYSTEM_H_
 
@@ -11,45 +11,36 @@
 #include <string>
 #include <vector>
 
+#include "alertmod/platform/status.h"
+
 namespace hx {
 namespace platform {
 
-// Outcome of one file-system call: success, or a readable account of what
-// failed ("cannot remove \"/x/y\": Permission denied").
-struct FsStatus {
-  bool ok = true;
-  std::string error;
-
-  static FsStatus Success() { return FsStatus{}; }
-  static FsStatus Failure(std::string text) { return FsStatus{false, std::move(text)}; }
-};
-
 // `relative` joined to the current directory. Fails when the current
 // directory cannot be read; `absolute` is then left unchanged.
-FsStatus AbsolutePath(const std::string& relative, std::string* absolute);
+Status AbsolutePath(const std::string& relative, std::string* absolute);
 
 // Creates the directory `path` (one level). Succeeds when it was created or
 // already is a directory; fails when it cannot be made or a non-directory has
 // that name.
-FsStatus MakeDirectory(const std::string& path);
+Status MakeDirectory(const std::string& path);
 
 // Removes the file `path`; a file that is already gone is no error.
-FsStatus DeleteFile(const std::string& path);
+Status DeleteFile(const std::string& path);
 
 // The names of the regular files in `directory` (symbolic links followed),
-// in no particular order. Fails when the directory cannot be read; `exists`
-// is then set to false when the reason is that it does not exist.
-FsStatus ListRegularFiles(const std::string& directory, std::vector<std::string>* names,
-                          bool* exists);
+// in no particular order. Fails when the directory cannot be read
+// (IsNotFound when it does not exist).
+Status ListRegularFiles(const std::string& directory, std::vector<std::string>* names);
 
 // Bytes available to an unprivileged caller on the volume of `directory`.
 // Fails when the volume cannot be queried; `bytes` is then unchanged.
-FsStatus QueryFreeBytes(const std::string& directory, uint64_t* bytes);
+Status QueryFreeBytes(const std::string& directory, uint64_t* bytes);
 
 // Replaces the free-space query. A null `query` restores the system's query.
 // Install a replacement before the module starts work; it must be safe to
 // call from any thread.
-using FreeBytesQuery = FsStatus (*)(void* context, const std::string& directory, uint64_t* bytes);
+using FreeBytesQuery = Status (*)(void* context, const std::string& directory, uint64_t* bytes);
 void SetFreeBytesQuery(FreeBytesQuery query, void* context);
 
 }  // namespace platform

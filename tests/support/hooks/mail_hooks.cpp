@@ -14,12 +14,12 @@ struct TestQuery {
 };
 std::atomic<TestQuery*> g_query{nullptr};
 
-hx::platform::FsStatus AskTest(void*, const std::string&, uint64_t* bytes) {
+hx::platform::Status AskTest(void*, const std::string&, uint64_t* bytes) {
   TestQuery* query = g_query.load();
   if (query != nullptr && query->query(query->context, bytes)) {
-    return hx::platform::FsStatus::Success();
+    return hx::platform::Status::OK();
   }
-  return hx::platform::FsStatus::Failure("the test's volume cannot be queried");
+  return hx::platform::Status::Failure("the test's volume cannot be queried");
 }
 
 void SetFreeBytesQuery(FreeBytesFn query, void* context) {
