@@ -6,8 +6,9 @@
 #define ALERTMOD_MAIL_NOTIFY_FILE_H_
 
 #include <cstddef>
-#include <cstdio>
 #include <string>
+
+#include "alertmod/platform/files.h"
 
 namespace hx {
 
@@ -35,7 +36,8 @@ class CNotifyFileImpl final : public INotifyFile {
   size_t Read(void* buffer, size_t count) override;
 
  private:
-  FILE* m_file;
+  platform::File m_file;
+  bool m_readFailed = false;
 };
 
 }  // namespace hx

@@ -1,9 +1,9 @@
 #include "alertmod/video/clip_writer.h"
 
-#include <cstdio>
 #include <exception>
 
 #include "alertmod/diag/log.h"
+#include "alertmod/platform/files.h"
 #include "alertmod/video/ps_packet.h"
 #include "alertmod/video/stream_info.h"
 
@@ -112,12 +112,13 @@ bool WriteJpegAttachment(const CVideoEmailStream& stream, const std::string& pat
   if (stream.Gops().empty() || stream.Gops().front().frames.empty() || path.empty()) return false;
   const Payload payload = PayloadOf(stream.Gops().front().frames.front());
   if (payload.data == nullptr) return false;
-  FILE* file = fopen(path.c_str(), "w+b");
-  if (file == nullptr) return false;
+  platform::File file;
+  if (!platform::File::OpenForWriting(path, false, &file).ok()) return false;
   // A short write (a full disk) would mail a truncated picture.
-  const bool written = fwrite(payload.data, 1, payload.size, file) == payload.size;
-  const bool closed = fclose(file) == 0;
-  return written && closed;
+  size_t written = 0;
+  const bool wrote = file.Write(payload.data, payload.size, &written).ok();
+  const bool closed = file.Close().ok();
+  return wrote && written == payload.size && closed;
 }
 
 }  // namespace hx
