@@ -9,12 +9,12 @@
 #define ALERTMOD_MAIL_NOTIFY_FILE_STREAM_H_
 
 #include <cstdint>
-#include <fstream>
 #include <ios>
 #include <streambuf>
 #include <string>
 
 #include "alertmod/host_records.h"
+#include "alertmod/platform/files.h"
 
 namespace hx {
 
@@ -26,7 +26,8 @@ class INotifyFileStream {
  public:
   virtual ~INotifyFileStream() = default;
   // Closes any open file and opens `path` for writing with `mode` plus
-  // output; the file is created or truncated. Clears an earlier error state.
+  // output; the file is created or truncated, or appended to when `mode`
+  // holds app. Clears an earlier error state.
   // Returns true when the stream is good afterwards.
   virtual bool Open(const std::string& path, std::ios_base::openmode mode) = 0;
   // Closes the file, writing out what is buffered. A failed close (or closing
@@ -60,8 +61,10 @@ class INotifyFileStream {
   virtual bool RemoveFile(const std::string& path) = 0;
 };
 
-// The stream the worker uses, writing through std::ofstream. Log lines (a
-// failed free-space query) go to the host through `callback`.
+// The stream the worker uses, writing through a platform::File with a buffer
+// of its own, so that the many short writes of a message cost few system
+// calls. A failed write of the buffer puts the stream in its error state.
+// Log lines (a failed free-space query) go to the host through `callback`.
 class NotifyFileStreamImpl final : public INotifyFileStream {
  public:
   explicit NotifyFileStreamImpl(core::HostCallbackFn callback);
@@ -83,8 +86,16 @@ class NotifyFileStreamImpl final : public INotifyFileStream {
   bool RemoveFile(const std::string& path) override;
 
  private:
+  // Adds `size` bytes to the buffer, writing it out when it is full.
+  void Append(const char* data, size_t size);
+  // Writes the buffer out; a failure sets the error state.
+  void Flush();
+
   core::HostCallbackFn m_callback;
-  std::ofstream m_stream;
+  platform::File m_file;
+  std::string m_buffer;
+  uint64_t m_flushedBytes = 0;
+  bool m_failed = false;
 };
 
 }  // namespace hx
