@@ -8,8 +8,11 @@
 #include "alertmod/diag/log.h"
 #include "alertmod/platform/shared_library.h"
 
-// Binds the member named like the symbol; keeps name and member in step.
-#define AV_BIND(symbol) Bind(#symbol, symbol)
+// Expanded over a library's symbol list inside its Resolve: every required
+// symbol must be found for `resolved` to stay true; an optional one may be
+// missing.
+#define AV_BIND_REQUIRED(symbol) resolved &= Bind(#symbol, symbol);
+#define AV_BIND_OPTIONAL(symbol) Bind(#symbol, symbol);
 
 namespace hx {
 namespace {
@@ -97,31 +100,9 @@ bool AVCodecLib::Load() {
 }
 
 void AVCodecLib::Resolve() {
-  bool ok = AV_BIND(avcodec_version);
-  ok &= AV_BIND(avcodec_find_decoder);
-  ok &= AV_BIND(avcodec_find_encoder);
-  ok &= AV_BIND(av_packet_alloc);
-  ok &= AV_BIND(av_packet_free);
-  ok &= AV_BIND(av_packet_unref);
-  ok &= AV_BIND(av_new_packet);
-  ok &= AV_BIND(av_get_bits_per_sample);
-  ok &= AV_BIND(avcodec_send_packet);
-  ok &= AV_BIND(avcodec_receive_frame);
-  ok &= AV_BIND(avcodec_send_frame);
-  ok &= AV_BIND(avcodec_receive_packet);
-  ok &= AV_BIND(avcodec_alloc_context3);
-  ok &= AV_BIND(avcodec_parameters_from_context);
-  ok &= AV_BIND(avcodec_parameters_to_context);
-  ok &= AV_BIND(avcodec_open2);
-  ok &= AV_BIND(avcodec_is_open);
-  ok &= AV_BIND(avcodec_close);
-  ok &= AV_BIND(avcodec_free_context);
-  ok &= AV_BIND(avcodec_decode_subtitle2);
-  ok &= AV_BIND(avsubtitle_free);
-  ok &= AV_BIND(av_parser_init);
-  ok &= AV_BIND(av_parser_parse2);
-  ok &= AV_BIND(av_parser_close);
-  m_resolved = ok && HasModule();
+  bool resolved = true;
+  ALERTMOD_AVCODEC_SYMBOLS(AV_BIND_REQUIRED, AV_BIND_REQUIRED, AV_BIND_OPTIONAL)
+  m_resolved = resolved && HasModule();
 }
 
 bool AVFormatLib::Load() {
@@ -129,25 +110,9 @@ bool AVFormatLib::Load() {
 }
 
 void AVFormatLib::Resolve() {
-  AV_BIND(av_register_all);
-  bool ok = AV_BIND(avformat_version);
-  ok &= AV_BIND(avformat_alloc_context);
-  ok &= AV_BIND(av_guess_format);
-  ok &= AV_BIND(avio_open2);
-  ok &= AV_BIND(avformat_new_stream);
-  ok &= AV_BIND(avformat_write_header);
-  ok &= AV_BIND(avformat_query_codec);
-  ok &= AV_BIND(av_write_frame);
-  ok &= AV_BIND(av_interleaved_write_frame);
-  ok &= AV_BIND(avformat_open_input);
-  ok &= AV_BIND(avformat_close_input);
-  ok &= AV_BIND(av_read_frame);
-  ok &= AV_BIND(av_write_trailer);
-  ok &= AV_BIND(avio_close);
-  ok &= AV_BIND(avio_closep);
-  ok &= AV_BIND(avformat_free_context);
-  ok &= AV_BIND(avformat_seek_file);
-  m_resolved = ok && HasModule();
+  bool resolved = true;
+  ALERTMOD_AVFORMAT_SYMBOLS(AV_BIND_REQUIRED, AV_BIND_REQUIRED, AV_BIND_OPTIONAL)
+  m_resolved = resolved && HasModule();
 }
 
 bool AVUtilLib::Load() {
@@ -155,21 +120,9 @@ bool AVUtilLib::Load() {
 }
 
 void AVUtilLib::Resolve() {
-  bool ok = AV_BIND(avutil_version);
-  ok &= AV_BIND(av_dict_set_int);
-  ok &= AV_BIND(av_dict_set);
-  ok &= AV_BIND(av_dict_free);
-  ok &= AV_BIND(av_rescale_q);
-  ok &= AV_BIND(av_d2q);
-  ok &= AV_BIND(av_frame_alloc);
-  ok &= AV_BIND(av_frame_free);
-  ok &= AV_BIND(av_strdup);
-  ok &= AV_BIND(av_mallocz);
-  ok &= AV_BIND(av_get_pix_fmt_name);
-  ok &= AV_BIND(av_channel_layout_default);
-  ok &= AV_BIND(av_log_set_callback);
-  ok &= AV_BIND(av_log_default_callback);
-  m_resolved = ok && HasModule();
+  bool resolved = true;
+  ALERTMOD_AVUTIL_SYMBOLS(AV_BIND_REQUIRED, AV_BIND_REQUIRED, AV_BIND_OPTIONAL)
+  m_resolved = resolved && HasModule();
 }
 
 bool AVFilterLib::Load() {
@@ -177,19 +130,9 @@ bool AVFilterLib::Load() {
 }
 
 void AVFilterLib::Resolve() {
-  AV_BIND(avfilter_register_all);
-  bool ok = AV_BIND(avfilter_version);
-  ok &= AV_BIND(avfilter_graph_free);
-  ok &= AV_BIND(av_buffersrc_add_frame_flags);
-  ok &= AV_BIND(av_buffersink_get_frame);
-  ok &= AV_BIND(avfilter_graph_alloc);
-  ok &= AV_BIND(avfilter_graph_create_filter);
-  ok &= AV_BIND(avfilter_get_by_name);
-  ok &= AV_BIND(avfilter_inout_alloc);
-  ok &= AV_BIND(avfilter_graph_parse_ptr);
-  ok &= AV_BIND(avfilter_graph_config);
-  ok &= AV_BIND(avfilter_inout_free);
-  m_resolved = ok && HasModule();
+  bool resolved = true;
+  ALERTMOD_AVFILTER_SYMBOLS(AV_BIND_REQUIRED, AV_BIND_REQUIRED, AV_BIND_OPTIONAL)
+  m_resolved = resolved && HasModule();
 }
 
 bool SWResampleLib::Load() {
@@ -197,13 +140,9 @@ bool SWResampleLib::Load() {
 }
 
 void SWResampleLib::Resolve() {
-  bool ok = AV_BIND(swresample_version);
-  ok &= AV_BIND(swr_alloc_set_opts2);
-  ok &= AV_BIND(swr_init);
-  ok &= AV_BIND(swr_free);
-  ok &= AV_BIND(swr_convert_frame);
-  ok &= AV_BIND(swr_get_delay);
-  m_resolved = ok && HasModule();
+  bool resolved = true;
+  ALERTMOD_SWRESAMPLE_SYMBOLS(AV_BIND_REQUIRED, AV_BIND_REQUIRED, AV_BIND_OPTIONAL)
+  m_resolved = resolved && HasModule();
 }
 
 MultiLibWrapper::~MultiLibWrapper() = default;

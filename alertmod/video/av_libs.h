@@ -23,6 +23,7 @@
 #include <vector>
 
 #include "alertmod/host_records.h"
+#include "alertmod/video/av_symbols.h"
 
 extern "C" {
 #include <libavcodec/avcodec.h>
@@ -93,36 +94,20 @@ class LibWrapper {
   std::string m_directory;
 };
 
+// A library class has one function pointer per symbol of its list in
+// av_symbols.h, named like the symbol and null until resolved.
+#define ALERTMOD_AV_MEMBER(symbol) decltype(&::symbol) symbol = nullptr;
+// The optional symbols are gone from the current headers, so their type is
+// spelt out.
+#define ALERTMOD_AV_OPTIONAL_MEMBER(symbol) void (*symbol)() = nullptr;
+
 class AVCodecLib : public LibWrapper {
  public:
   bool Load() override;
   void Resolve() override;
   bool IsResolved() const override { return m_resolved; }
 
-  decltype(&::avcodec_version) avcodec_version = nullptr;
-  decltype(&::avcodec_find_decoder) avcodec_find_decoder = nullptr;
-  decltype(&::avcodec_find_encoder) avcodec_find_encoder = nullptr;
-  decltype(&::av_packet_alloc) av_packet_alloc = nullptr;
-  decltype(&::av_packet_free) av_packet_free = nullptr;
-  decltype(&::av_packet_unref) av_packet_unref = nullptr;
-  decltype(&::av_new_packet) av_new_packet = nullptr;
-  decltype(&::av_get_bits_per_sample) av_get_bits_per_sample = nullptr;
-  decltype(&::avcodec_send_packet) avcodec_send_packet = nullptr;
-  decltype(&::avcodec_receive_frame) avcodec_receive_frame = nullptr;
-  decltype(&::avcodec_send_frame) avcodec_send_frame = nullptr;
-  decltype(&::avcodec_receive_packet) avcodec_receive_packet = nullptr;
-  decltype(&::avcodec_alloc_context3) avcodec_alloc_context3 = nullptr;
-  decltype(&::avcodec_parameters_from_context) avcodec_parameters_from_context = nullptr;
-  decltype(&::avcodec_parameters_to_context) avcodec_parameters_to_context = nullptr;
-  decltype(&::avcodec_open2) avcodec_open2 = nullptr;
-  decltype(&::avcodec_is_open) avcodec_is_open = nullptr;
-  decltype(&::avcodec_close) avcodec_close = nullptr;
-  decltype(&::avcodec_free_context) avcodec_free_context = nullptr;
-  decltype(&::avcodec_decode_subtitle2) avcodec_decode_subtitle2 = nullptr;
-  decltype(&::avsubtitle_free) avsubtitle_free = nullptr;
-  decltype(&::av_parser_init) av_parser_init = nullptr;
-  decltype(&::av_parser_parse2) av_parser_parse2 = nullptr;
-  decltype(&::av_parser_close) av_parser_close = nullptr;
+  ALERTMOD_AVCODEC_SYMBOLS(ALERTMOD_AV_MEMBER, ALERTMOD_AV_MEMBER, ALERTMOD_AV_OPTIONAL_MEMBER)
 
  private:
   bool m_resolved = false;
@@ -134,25 +119,7 @@ class AVFormatLib : public LibWrapper {
   void Resolve() override;
   bool IsResolved() const override { return m_resolved; }
 
-  decltype(&::avformat_version) avformat_version = nullptr;
-  // Only releases before FFmpeg 4 have it; optional.
-  void (*av_register_all)() = nullptr;
-  decltype(&::avformat_alloc_context) avformat_alloc_context = nullptr;
-  decltype(&::av_guess_format) av_guess_format = nullptr;
-  decltype(&::avio_open2) avio_open2 = nullptr;
-  decltype(&::avformat_new_stream) avformat_new_stream = nullptr;
-  decltype(&::avformat_write_header) avformat_write_header = nullptr;
-  decltype(&::avformat_query_codec) avformat_query_codec = nullptr;
-  decltype(&::av_write_frame) av_write_frame = nullptr;
-  decltype(&::av_interleaved_write_frame) av_interleaved_write_frame = nullptr;
-  decltype(&::avformat_open_input) avformat_open_input = nullptr;
-  decltype(&::avformat_close_input) avformat_close_input = nullptr;
-  decltype(&::av_read_frame) av_read_frame = nullptr;
-  decltype(&::av_write_trailer) av_write_trailer = nullptr;
-  decltype(&::avio_close) avio_close = nullptr;
-  decltype(&::avio_closep) avio_closep = nullptr;
-  decltype(&::avformat_free_context) avformat_free_context = nullptr;
-  decltype(&::avformat_seek_file) avformat_seek_file = nullptr;
+  ALERTMOD_AVFORMAT_SYMBOLS(ALERTMOD_AV_MEMBER, ALERTMOD_AV_MEMBER, ALERTMOD_AV_OPTIONAL_MEMBER)
 
  private:
   bool m_resolved = false;
@@ -164,20 +131,7 @@ class AVUtilLib : public LibWrapper {
   void Resolve() override;
   bool IsResolved() const override { return m_resolved; }
 
-  decltype(&::avutil_version) avutil_version = nullptr;
-  decltype(&::av_dict_set_int) av_dict_set_int = nullptr;
-  decltype(&::av_dict_set) av_dict_set = nullptr;
-  decltype(&::av_dict_free) av_dict_free = nullptr;
-  decltype(&::av_rescale_q) av_rescale_q = nullptr;
-  decltype(&::av_d2q) av_d2q = nullptr;
-  decltype(&::av_frame_alloc) av_frame_alloc = nullptr;
-  decltype(&::av_frame_free) av_frame_free = nullptr;
-  decltype(&::av_strdup) av_strdup = nullptr;
-  decltype(&::av_mallocz) av_mallocz = nullptr;
-  decltype(&::av_get_pix_fmt_name) av_get_pix_fmt_name = nullptr;
-  decltype(&::av_channel_layout_default) av_channel_layout_default = nullptr;
-  decltype(&::av_log_set_callback) av_log_set_callback = nullptr;
-  decltype(&::av_log_default_callback) av_log_default_callback = nullptr;
+  ALERTMOD_AVUTIL_SYMBOLS(ALERTMOD_AV_MEMBER, ALERTMOD_AV_MEMBER, ALERTMOD_AV_OPTIONAL_MEMBER)
 
  private:
   bool m_resolved = false;
@@ -189,19 +143,7 @@ class AVFilterLib : public LibWrapper {
   void Resolve() override;
   bool IsResolved() const override { return m_resolved; }
 
-  decltype(&::avfilter_version) avfilter_version = nullptr;
-  // Only releases before FFmpeg 4 have it; optional.
-  void (*avfilter_register_all)() = nullptr;
-  decltype(&::avfilter_graph_free) avfilter_graph_free = nullptr;
-  decltype(&::av_buffersrc_add_frame_flags) av_buffersrc_add_frame_flags = nullptr;
-  decltype(&::av_buffersink_get_frame) av_buffersink_get_frame = nullptr;
-  decltype(&::avfilter_graph_alloc) avfilter_graph_alloc = nullptr;
-  decltype(&::avfilter_graph_create_filter) avfilter_graph_create_filter = nullptr;
-  decltype(&::avfilter_get_by_name) avfilter_get_by_name = nullptr;
-  decltype(&::avfilter_inout_alloc) avfilter_inout_alloc = nullptr;
-  decltype(&::avfilter_graph_parse_ptr) avfilter_graph_parse_ptr = nullptr;
-  decltype(&::avfilter_graph_config) avfilter_graph_config = nullptr;
-  decltype(&::avfilter_inout_free) avfilter_inout_free = nullptr;
+  ALERTMOD_AVFILTER_SYMBOLS(ALERTMOD_AV_MEMBER, ALERTMOD_AV_MEMBER, ALERTMOD_AV_OPTIONAL_MEMBER)
 
  private:
   bool m_resolved = false;
@@ -213,16 +155,14 @@ class SWResampleLib : public LibWrapper {
   void Resolve() override;
   bool IsResolved() const override { return m_resolved; }
 
-  decltype(&::swresample_version) swresample_version = nullptr;
-  decltype(&::swr_alloc_set_opts2) swr_alloc_set_opts2 = nullptr;
-  decltype(&::swr_init) swr_init = nullptr;
-  decltype(&::swr_free) swr_free = nullptr;
-  decltype(&::swr_convert_frame) swr_convert_frame = nullptr;
-  decltype(&::swr_get_delay) swr_get_delay = nullptr;
+  ALERTMOD_SWRESAMPLE_SYMBOLS(ALERTMOD_AV_MEMBER, ALERTMOD_AV_MEMBER, ALERTMOD_AV_OPTIONAL_MEMBER)
 
  private:
   bool m_resolved = false;
 };
+
+#undef ALERTMOD_AV_MEMBER
+#undef ALERTMOD_AV_OPTIONAL_MEMBER
 
 // A set of libraries that is only of use when every one of them is loaded.
 class MultiLibWrapper {
