@@ -1,3 +1,9 @@
+# Clang checks the lock annotations (alertmod/platform/thread_annotations.h)
+# and fails the build on a breach; other compilers ignore the annotations.
+if(CMAKE_CXX_COMPILER_ID STREQUAL "Clang")
+  add_compile_options(-Wthread-safety -Werror=thread-safety)
+endif()
+
 if(ALERTMOD_SANITIZE STREQUAL "address")
   add_compile_options(-fsanitize=address,undefined -fno-omit-frame-pointer -fno-sanitize-recover=undefined)
   add_link_options(-fsanitize=address,undefined)
