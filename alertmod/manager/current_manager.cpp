@@ -1,17 +1,18 @@
 #include "alertmod/manager/current_manager.h"
 
 #include <atomic>
-#include <condition_variable>
-#include <mutex>
+
+#include "alertmod/platform/mutex.h"
+#include "alertmod/platform/thread_annotations.h"
 
 namespace hx {
 namespace {
 
 std::atomic<NotifyManager*> g_current{nullptr};
 
-std::mutex g_lentMutex;
-std::condition_variable g_lentLeft;
-int g_lentInside = 0;  // guarded by g_lentMutex
+Mutex g_lentMutex;
+ConditionVariable g_lentLeft;
+int g_lentInside GUARDED_BY(g_lentMutex) = 0;
 
 }  // namespace
 
@@ -28,21 +29,21 @@ NotifyManager* TakeCurrentManager() {
 }
 
 LentThreadScope::LentThreadScope() {
-  std::lock_guard<std::mutex> lock(g_lentMutex);
+  MutexLock lock(g_lentMutex);
   ++g_lentInside;
 }
 
 LentThreadScope::~LentThreadScope() {
   {
-    std::lock_guard<std::mutex> lock(g_lentMutex);
+    MutexLock lock(g_lentMutex);
     --g_lentInside;
   }
-  g_lentLeft.notify_all();
+  g_lentLeft.NotifyAll();
 }
 
 void WaitForLentThreads() {
-  std::unique_lock<std::mutex> lock(g_lentMutex);
-  g_lentLeft.wait(lock, [] { return g_lentInside == 0; });
+  MutexLock lock(g_lentMutex);
+  while (g_lentInside != 0) g_lentLeft.Wait(g_lentMutex);
 }
 
 }  // namespace hx

@@ -52,14 +52,14 @@ void NotifyManager::SetWatchdogPeriod(std::chrono::milliseconds period) {
 
 void NotifyManager::QueueWorkItem(std::shared_ptr<NotifyWorkItem> item, bool atFront) {
   {
-    std::lock_guard<std::mutex> lock(m_queueMutex);
+    MutexLock lock(m_queueMutex);
     if (atFront) {
       m_workQueue.push_front(std::move(item));
     } else {
       m_workQueue.push_back(std::move(item));
     }
   }
-  m_queueSignal.notify_one();
+  m_queueSignal.NotifyOne();
 }
 
 void NotifyManager::Stop() {
@@ -72,13 +72,13 @@ void NotifyManager::Shutdown() {
 }
 
 size_t NotifyManager::QueuedCount() const {
-  std::lock_guard<std::mutex> lock(m_queueMutex);
+  MutexLock lock(m_queueMutex);
   return m_workQueue.size();
 }
 
 void NotifyManager::PublishWorkerSettings(const WorkerSettings& settings,
                                           bool configurationReplaced) {
-  std::lock_guard<std::mutex> lock(m_queueMutex);
+  MutexLock lock(m_queueMutex);
   m_workerSettings = settings;
   m_settingsChanged = true;
   // New limits alone arriving before the worker looks must not hide an
@@ -87,7 +87,7 @@ void NotifyManager::PublishWorkerSettings(const WorkerSettings& settings,
 }
 
 bool NotifyManager::TakeSettingsChange(WorkerSettings* settings, bool* replaced) {
-  std::lock_guard<std::mutex> lock(m_queueMutex);
+  MutexLock lock(m_queueMutex);
   *settings = m_workerSettings;
   *replaced = m_configReplaced;
   bool changed = m_settingsChanged;
@@ -97,14 +97,16 @@ bool NotifyManager::TakeSettingsChange(WorkerSettings* settings, bool* replaced)
 }
 
 std::shared_ptr<NotifyWorkItem> NotifyManager::TakeItem(const IWorkerJob& job) {
-  std::unique_lock<std::mutex> lock(m_queueMutex);
+  MutexLock lock(m_queueMutex);
   if (job.HasPendingRetries()) {
     // Retries must run even when no notification arrives, so the worker
     // polls; a new item still ends the wait at once.
-    m_queueSignal.wait_for(lock, kRetryPollInterval, [this] { return !m_workQueue.empty(); });
+    const auto deadline = std::chrono::steady_clock::now() + kRetryPollInterval;
+    while (m_workQueue.empty() && m_queueSignal.WaitUntil(m_queueMutex, deadline)) {
+    }
     if (m_workQueue.empty()) return nullptr;
   } else {
-    m_queueSignal.wait(lock, [this] { return !m_workQueue.empty(); });
+    while (m_workQueue.empty()) m_queueSignal.Wait(m_queueMutex);
   }
   std::shared_ptr<NotifyWorkItem> item = std::move(m_workQueue.front());
   m_workQueue.pop_front();
@@ -127,7 +129,7 @@ void NotifyManager::RunItem(IWorkerJob& job, NotifyWorkItem& item) {
 
 void NotifyManager::RunWorker() {
   {
-    std::lock_guard<std::mutex> lock(m_stopMutex);
+    MutexLock lock(m_stopMutex);
     if (m_stopped) return;
   }
   // However the loop ends, the watchdog must learn that the worker is gone.
@@ -156,22 +158,24 @@ void NotifyManager::RunWorker() {
 
 void NotifyManager::MarkStopped() {
   {
-    std::lock_guard<std::mutex> lock(m_stopMutex);
+    MutexLock lock(m_stopMutex);
     m_stopped = true;
   }
-  m_stopSignal.notify_all();
+  m_stopSignal.NotifyAll();
 }
 
 void NotifyManager::RunWatchdog() {
-  std::unique_lock<std::mutex> lock(m_stopMutex);
+  MutexLock lock(m_stopMutex);
   while (!m_stopped) {
     // A monotonic deadline: a change of the wall clock must not stop or
     // hurry the ticks.
-    auto deadline = std::chrono::steady_clock::now() + m_watchdogPeriod;
-    if (m_stopSignal.wait_until(lock, deadline, [this] { return m_stopped; })) break;
-    lock.unlock();
+    const auto deadline = std::chrono::steady_clock::now() + m_watchdogPeriod;
+    while (!m_stopped && m_stopSignal.WaitUntil(m_stopMutex, deadline)) {
+    }
+    if (m_stopped) break;
+    lock.Unlock();
     SendTick();
-    lock.lock();
+    lock.Lock();
   }
 }
 

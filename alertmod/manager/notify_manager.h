@@ -13,11 +13,9 @@
 #define ALERTMOD_MANAGER_NOTIFY_MANAGER_H_
 
 #include <chrono>
-#include <condition_variable>
 #include <cstdint>
 #include <deque>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <vector>
 
@@ -29,6 +27,8 @@
 #include "alertmod/manager/stream_links.h"
 #include "alertmod/manager/throttle.h"
 #include "alertmod/manager/worker_job.h"
+#include "alertmod/platform/mutex.h"
+#include "alertmod/platform/thread_annotations.h"
 #include "alertmod/video/notify_ready.h"
 #include "alertmod/video/video_buffer.h"
 
@@ -74,7 +74,7 @@ class NotifyManager {
 
   // Puts `item` at the head of the work queue when `atFront`, else at the
   // tail, and wakes the worker. Any thread.
-  void QueueWorkItem(std::shared_ptr<NotifyWorkItem> item, bool atFront);
+  void QueueWorkItem(std::shared_ptr<NotifyWorkItem> item, bool atFront) EXCLUDES(m_queueMutex);
 
   // Queues a stop item at the head. The worker finishes its current item and
   // then leaves its loop. Any thread; does not wait.
@@ -88,11 +88,11 @@ class NotifyManager {
 
   // The worker loop. Returns after the stop item, or at once when the worker
   // has stopped before.
-  void RunWorker();
+  void RunWorker() EXCLUDES(m_queueMutex, m_stopMutex);
 
   // The watchdog loop: asks the host for a tick every period. Returns when the
   // worker has stopped.
-  void RunWatchdog();
+  void RunWatchdog() EXCLUDES(m_stopMutex);
 
   // The host's answer to a tick: releases notifications whose deadline passed.
   void OnTick();
@@ -147,7 +147,8 @@ class NotifyManager {
   // Hands new retry settings to the worker, which applies them before its next
   // item. `configurationReplaced` when they come with an accepted
   // configuration: the worker then also empties its retry queue. Any thread.
-  void PublishWorkerSettings(const WorkerSettings& settings, bool configurationReplaced);
+  void PublishWorkerSettings(const WorkerSettings& settings, bool configurationReplaced)
+      EXCLUDES(m_queueMutex);
 
   // The watchdog's period for managers created from now on (default 10 s).
   static void SetWatchdogPeriod(std::chrono::milliseconds period);
@@ -161,7 +162,7 @@ class NotifyManager {
   // Read access for tests and the parts built on the manager. Host threads.
   size_t PendingCount() const { return m_pending.size(); }
   size_t ReadyCount() const { return m_ready.size(); }
-  size_t QueuedCount() const;
+  size_t QueuedCount() const EXCLUDES(m_queueMutex);
   const HostSystemCatalogue& Catalogue() const { return m_catalogue; }
   const WantedVideo& Wanted() const { return m_wanted; }
   const SourceAliases& Aliases() const { return m_aliases; }
@@ -181,12 +182,12 @@ class NotifyManager {
   CaptureContext MakeCaptureContext();
   void ApplyFullDocument(const TiXmlDocument& document, const TiXmlElement& trellan);
   void ApplyLimitChanges(const NotifyCfg& before);
-  std::shared_ptr<NotifyWorkItem> TakeItem(const IWorkerJob& job);
+  std::shared_ptr<NotifyWorkItem> TakeItem(const IWorkerJob& job) EXCLUDES(m_queueMutex);
   // Whether settings were published since the last call; `*replaced` tells
   // whether an accepted configuration came with them.
-  bool TakeSettingsChange(WorkerSettings* settings, bool* replaced);
+  bool TakeSettingsChange(WorkerSettings* settings, bool* replaced) EXCLUDES(m_queueMutex);
   void RunItem(IWorkerJob& job, NotifyWorkItem& item);
-  void MarkStopped();
+  void MarkStopped() EXCLUDES(m_stopMutex);
   void SendTick();
   void LoadConfig();
   void PublishConfigSettings(bool configurationReplaced);
@@ -200,19 +201,19 @@ class NotifyManager {
 
   NotifyCfg m_config;  // host threads only
 
-  mutable std::mutex m_queueMutex;
-  std::condition_variable m_queueSignal;
-  std::deque<std::shared_ptr<NotifyWorkItem>> m_workQueue;
-  WorkerSettings m_workerSettings;  // guarded by m_queueMutex
-  bool m_settingsChanged = false;   // guarded by m_queueMutex
-  bool m_configReplaced = false;    // guarded by m_queueMutex
+  mutable Mutex m_queueMutex;
+  ConditionVariable m_queueSignal;
+  std::deque<std::shared_ptr<NotifyWorkItem>> m_workQueue GUARDED_BY(m_queueMutex);
+  WorkerSettings m_workerSettings GUARDED_BY(m_queueMutex);
+  bool m_settingsChanged GUARDED_BY(m_queueMutex) = false;
+  bool m_configReplaced GUARDED_BY(m_queueMutex) = false;
 
   std::vector<std::shared_ptr<SNOTIFY_CALLBACK>> m_pending;
   std::vector<std::shared_ptr<SNOTIFY_CALLBACK>> m_ready;
 
-  std::mutex m_stopMutex;
-  std::condition_variable m_stopSignal;
-  bool m_stopped = false;  // guarded by m_stopMutex
+  Mutex m_stopMutex;
+  ConditionVariable m_stopSignal;
+  bool m_stopped GUARDED_BY(m_stopMutex) = false;
 
   // Host-side state: Write and IOCTL code 2 only, one call at a time.
   ThrottleTable m_throttle;
