@@ -23,11 +23,11 @@ class ProcessRegistry final {
     return registry;
   }
 
-  std::mutex lock;
-  std::map<uint32_t, std::shared_ptr<client>> clients;
-  bool closed = false;
-  uint32_t lastId = 0;
-  uint32_t moduleId = 0;
+  Mutex lock;
+  std::map<uint32_t, std::shared_ptr<client>> clients GUARDED_BY(lock);
+  bool closed GUARDED_BY(lock) = false;
+  uint32_t lastId GUARDED_BY(lock) = 0;
+  uint32_t moduleId GUARDED_BY(lock) = 0;
   std::atomic<SendFunction> send{nullptr};
   std::atomic<core::HostCallbackFn> logTo{nullptr};
 
@@ -80,9 +80,8 @@ std::string BuildStartPayload(const ProcessOptions& options) {
   return payload;
 }
 
-// Chooses the next id not in use. Requires the registry lock. False when
-// every id is taken.
-bool NextFreeId(ProcessRegistry& registry, uint32_t& id) {
+// Chooses the next id not in use. False when every id is taken.
+bool NextFreeId(ProcessRegistry& registry, uint32_t& id) REQUIRES(registry.lock) {
   for (uint32_t attempt = 0; attempt < kCounterAttempts; ++attempt) {
     id = ((registry.lastId + 1) & kIdCounterMask) | (registry.moduleId << 4);
     registry.lastId = id;
@@ -91,25 +90,31 @@ bool NextFreeId(ProcessRegistry& registry, uint32_t& id) {
   return false;
 }
 
-void SetState(client& process, int32_t state) {
-  std::lock_guard<std::mutex> lock(process.lock);
-  process.state = state;
-}
-
 // Gives up a run: the id is forgotten, so that anything the host still sends
 // for it is dropped, and the run counts as failed. Returns false, changing
 // nothing, when the run has reached `settled` meanwhile and its result
 // stands.
-template <typename Settled>
-bool Abandon(const std::shared_ptr<client>& process, Settled settled) {
+bool Abandon(const std::shared_ptr<client>& process, bool (*settled)(int32_t state)) {
   ProcessRegistry& registry = ProcessRegistry::Instance();
-  std::lock_guard<std::mutex> lock(registry.lock);
-  std::lock_guard<std::mutex> clientLock(process->lock);
-  if (settled(process->state)) return false;
-  auto found = registry.clients.find(process->id);
+  // The registry lock is held throughout, so that no message of the host
+  // reaches the run between the two steps.
+  MutexLock lock(registry.lock);
+  if (!process->FailUnless(settled)) return false;
+  auto found = registry.clients.find(process->Id());
   if (found != registry.clients.end() && found->second == process) registry.clients.erase(found);
-  process->state = kStateFailed;
   return true;
+}
+
+bool IsAnswered(int32_t state) {
+  return state != kStateStarting;
+}
+
+bool IsExited(int32_t state) {
+  return state == kStateExited;
+}
+
+bool HasEnded(int32_t state) {
+  return state == kStateExited || state == kStateFailed;
 }
 
 // Waits for the host's answer to the start of `process`. A host that takes
@@ -118,18 +123,12 @@ bool Abandon(const std::shared_ptr<client>& process, Settled settled) {
 // started. An answer that comes in while it is given up still counts.
 void AwaitStartAnswer(const std::shared_ptr<client>& process, const std::string& program) {
   const std::chrono::milliseconds timeout(g_startAnswerTimeoutMs.load());
-  const auto answered = [](int32_t state) { return state != kStateStarting; };
-  {
-    std::unique_lock<std::mutex> lock(process->lock);
-    if (process->condition.wait_for(lock, timeout, [&] { return answered(process->state); })) {
-      return;
-    }
-  }
-  if (!Abandon(process, answered)) return;
+  if (process->WaitWhileIn(kStateStarting, timeout)) return;
+  if (!Abandon(process, IsAnswered)) return;
   ProcessRegistry& registry = ProcessRegistry::Instance();
   uint32_t moduleId = 0;
   {
-    std::lock_guard<std::mutex> lock(registry.lock);
+    MutexLock lock(registry.lock);
     moduleId = registry.moduleId;
   }
   LogToHost(moduleId, registry.logTo.load(), LogLevelError,
@@ -140,9 +139,124 @@ void AwaitStartAnswer(const std::shared_ptr<client>& process, const std::string&
 
 }  // namespace
 
+int32_t client::State() const {
+  MutexLock lock(m_lock);
+  return m_state;
+}
+
+uint32_t client::Id() const {
+  MutexLock lock(m_lock);
+  return m_id;
+}
+
+int32_t client::Value() const {
+  MutexLock lock(m_lock);
+  return m_value;
+}
+
+bool client::EndsInputAtWait() const {
+  MutexLock lock(m_lock);
+  return m_endInputAtWait;
+}
+
+void client::SetState(int32_t state) {
+  MutexLock lock(m_lock);
+  m_state = state;
+}
+
+void client::SetId(uint32_t id) {
+  MutexLock lock(m_lock);
+  m_id = id;
+}
+
+void client::SetEndInputAtWait(bool end) {
+  MutexLock lock(m_lock);
+  m_endInputAtWait = end;
+}
+
+bool client::Apply(uint32_t type, int32_t value, const char* payload, size_t length) {
+  MutexLock lock(m_lock);
+  bool ended = false;
+  switch (type) {
+    case core::kProcessOutput:
+      AppendOutput(m_standardOutput, payload, length);
+      break;
+    case core::kProcessErrorOutput:
+      AppendOutput(m_standardError, payload, length);
+      break;
+    case core::kProcessRunning:
+      m_value = value;
+      m_state = kStateRunning;
+      break;
+    default:  // failed or exited
+      m_value = value;
+      m_state = type == core::kProcessFailed ? kStateFailed : kStateExited;
+      ended = true;
+      break;
+  }
+  m_changed.NotifyAll();
+  return ended;
+}
+
+bool client::FailUnless(bool (*settled)(int32_t state)) {
+  MutexLock lock(m_lock);
+  if (settled(m_state)) return false;
+  m_state = kStateFailed;
+  m_changed.NotifyAll();
+  return true;
+}
+
+bool client::WaitWhileIn(int32_t state, std::chrono::milliseconds timeout) {
+  const auto deadline = std::chrono::steady_clock::now() + timeout;
+  MutexLock lock(m_lock);
+  while (m_state == state && m_changed.WaitUntil(m_lock, deadline)) {
+  }
+  return m_state != state;
+}
+
+bool client::ReadLine(std::string& line, int channel) {
+  MutexLock lock(m_lock);
+  std::string& buffer = channel == 0 ? m_standardOutput : m_standardError;
+  for (;;) {
+    std::string::size_type end = buffer.find('\n');
+    if (end != std::string::npos) {
+      line.assign(buffer, 0, end);
+      buffer.erase(0, end + 1);
+      return true;
+    }
+    if (m_state != kStateRunning) {
+      if (buffer.empty()) return false;
+      line.swap(buffer);
+      buffer.clear();
+      return true;
+    }
+    m_changed.Wait(m_lock);
+  }
+}
+
+bool client::TakeEndInputAtWait() {
+  MutexLock lock(m_lock);
+  const bool take = m_state == kStateRunning && m_endInputAtWait;
+  if (take) m_endInputAtWait = false;
+  return take;
+}
+
+void client::WaitUntilNotRunning() {
+  MutexLock lock(m_lock);
+  while (m_state == kStateRunning) m_changed.Wait(m_lock);
+}
+
+bool client::TakeResult(int32_t& exitCode, std::string* output) {
+  MutexLock lock(m_lock);
+  if (output != nullptr) output->swap(m_standardOutput);
+  if (m_state != kStateExited) return false;
+  exitCode = m_value;
+  return true;
+}
+
 void RegisterProcessService(uint32_t moduleId, SendFunction send, core::HostCallbackFn logTo) {
   ProcessRegistry& registry = ProcessRegistry::Instance();
-  std::lock_guard<std::mutex> lock(registry.lock);
+  MutexLock lock(registry.lock);
   registry.moduleId = moduleId;
   registry.send.store(send);
   registry.logTo.store(logTo);
@@ -151,18 +265,11 @@ void RegisterProcessService(uint32_t moduleId, SendFunction send, core::HostCall
 
 void ShutdownProcessService(bool closed) {
   ProcessRegistry& registry = ProcessRegistry::Instance();
-  std::lock_guard<std::mutex> lock(registry.lock);
+  MutexLock lock(registry.lock);
   for (auto& entry : registry.clients) {
-    client& process = *entry.second;
-    {
-      std::lock_guard<std::mutex> clientLock(process.lock);
-      // A run cut off here has no exit code; reporting 0 would read as
-      // success to a caller that then discards what the program was for.
-      if (process.state == kStateRunning || process.state == kStateStarting) {
-        process.state = kStateFailed;
-      }
-    }
-    process.condition.notify_all();
+    // A run cut off here has no exit code; reporting 0 would read as
+    // success to a caller that then discards what the program was for.
+    entry.second->FailUnless(HasEnded);
   }
   registry.clients.clear();
   registry.closed = closed;
@@ -178,30 +285,12 @@ int OnProcessMessage(const void* data, uint64_t length) {
   if (header.type < core::kProcessOutput || header.type > core::kProcessExited) return 0;
 
   ProcessRegistry& registry = ProcessRegistry::Instance();
-  std::lock_guard<std::mutex> lock(registry.lock);
+  MutexLock lock(registry.lock);
   auto found = registry.clients.find(header.id);
   if (found == registry.clients.end()) return 0;
-  std::shared_ptr<client> process = found->second;
-  {
-    std::lock_guard<std::mutex> clientLock(process->lock);
-    switch (header.type) {
-      case core::kProcessOutput:
-        AppendOutput(process->standardOutput, payload, payloadLength);
-        break;
-      case core::kProcessErrorOutput:
-        AppendOutput(process->standardError, payload, payloadLength);
-        break;
-      case core::kProcessRunning:
-        process->value = value;
-        process->state = kStateRunning;
-        break;
-      default:  // failed or exited: the id is free again
-        process->value = value;
-        process->state = header.type == core::kProcessFailed ? kStateFailed : kStateExited;
-        registry.clients.erase(found);
-        break;
-    }
-    process->condition.notify_all();
+  // An ended run's id is free again.
+  if (found->second->Apply(header.type, value, payload, payloadLength)) {
+    registry.clients.erase(found);
   }
   return 1;
 }
@@ -225,27 +314,27 @@ bool SendProcessMessage(uint32_t id, uint32_t type, uint32_t value, const void* 
 std::shared_ptr<client> StartProcess(const ProcessOptions& options) {
   auto process = std::make_shared<client>();
   if (options.arguments.empty()) {
-    process->state = kStateFailed;
+    process->SetState(kStateFailed);
     return process;
   }
   if (!(options.flags & kFlagKeepInputAtWait) && EndsInPs1(options.arguments[0])) {
-    process->endInputAtWait = true;
+    process->SetEndInputAtWait(true);
   }
   const std::string payload = BuildStartPayload(options);
   {
     // The start is sent under the registry lock, so that the host's answer,
     // which may come at once on another thread, finds the client registered.
     ProcessRegistry& registry = ProcessRegistry::Instance();
-    std::lock_guard<std::mutex> lock(registry.lock);
+    MutexLock lock(registry.lock);
     uint32_t id = 0;
     if (registry.closed || !NextFreeId(registry, id)) {
-      SetState(*process, kStateFailed);
+      process->SetState(kStateFailed);
       return process;
     }
-    process->id = id;
+    process->SetId(id);
     if (!SendProcessMessage(id, core::kProcessStart, options.flags, payload.data(),
                             payload.size())) {
-      SetState(*process, kStateFailed);
+      process->SetState(kStateFailed);
       return process;
     }
     registry.clients[id] = process;
@@ -256,36 +345,16 @@ std::shared_ptr<client> StartProcess(const ProcessOptions& options) {
 
 bool ReadOutputLine(client& process, std::string& line, int channel) {
   if (channel != 0 && channel != 1) return false;
-  std::unique_lock<std::mutex> lock(process.lock);
-  std::string& buffer = channel == 0 ? process.standardOutput : process.standardError;
-  for (;;) {
-    std::string::size_type end = buffer.find('\n');
-    if (end != std::string::npos) {
-      line.assign(buffer, 0, end);
-      buffer.erase(0, end + 1);
-      return true;
-    }
-    if (process.state != kStateRunning) {
-      if (buffer.empty()) return false;
-      line.swap(buffer);
-      buffer.clear();
-      return true;
-    }
-    process.condition.wait(lock);
-  }
+  return process.ReadLine(line, channel);
 }
 
 void WaitForExit(client& process) {
-  std::unique_lock<std::mutex> lock(process.lock);
-  if (process.state == kStateRunning && process.endInputAtWait) {
-    process.endInputAtWait = false;
-    // Sent without the client's lock: the host may be delivering output for
-    // this client meanwhile, which needs it.
-    lock.unlock();
-    SendProcessMessage(process.id, core::kProcessInput, 1, nullptr, 0);
-    lock.lock();
+  // Sent without the client's lock: the host may be delivering output for
+  // this client meanwhile, which needs it.
+  if (process.TakeEndInputAtWait()) {
+    SendProcessMessage(process.Id(), core::kProcessInput, 1, nullptr, 0);
   }
-  process.condition.wait(lock, [&] { return process.state != kStateRunning; });
+  process.WaitUntilNotRunning();
 }
 
 bool RunProcess(const std::vector<std::string>& arguments, const std::string& input,
@@ -293,31 +362,24 @@ bool RunProcess(const std::vector<std::string>& arguments, const std::string& in
   ProcessOptions options;
   options.arguments = arguments;
   std::shared_ptr<client> process = StartProcess(options);
-  {
-    std::lock_guard<std::mutex> lock(process->lock);
-    if (process->state == kStateFailed) return false;
-    process->endInputAtWait = false;
-  }
+  if (process->State() == kStateFailed) return false;
+  process->SetEndInputAtWait(false);
   bool inputSent =
-      SendProcessMessage(process->id, core::kProcessInput, 1, input.data(), input.size());
+      SendProcessMessage(process->Id(), core::kProcessInput, 1, input.data(), input.size());
   // The host ends the program's input at a message shorter than the
   // maximum; input filling whole messages needs one more, empty.
   if (inputSent && !input.empty() && input.size() % kMaxPayloadBytes == 0) {
-    inputSent = SendProcessMessage(process->id, core::kProcessInput, 1, nullptr, 0);
+    inputSent = SendProcessMessage(process->Id(), core::kProcessInput, 1, nullptr, 0);
   }
   // Without its input the program would wait for the end of it, and its
   // caller with it, until Close: the run is given up unless it has ended.
-  if (!inputSent && Abandon(process, [](int32_t state) { return state == kStateExited; })) {
+  if (!inputSent && Abandon(process, IsExited)) {
     return false;
   }
   std::string line;
   while (ReadOutputLine(*process, line, 1)) errorLines.push_back(line);
   WaitForExit(*process);
-  std::lock_guard<std::mutex> lock(process->lock);
-  if (output != nullptr) output->swap(process->standardOutput);
-  if (process->state != kStateExited) return false;
-  exitCode = process->value;
-  return true;
+  return process->TakeResult(exitCode, output);
 }
 
 void SetStartAnswerTimeout(std::chrono::milliseconds timeout) {
@@ -326,7 +388,7 @@ void SetStartAnswerTimeout(std::chrono::milliseconds timeout) {
 
 void SetLastProcessId(uint32_t id) {
   ProcessRegistry& registry = ProcessRegistry::Instance();
-  std::lock_guard<std::mutex> lock(registry.lock);
+  MutexLock lock(registry.lock);
   registry.lastId = id;
 }
 

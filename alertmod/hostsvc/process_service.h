@@ -13,15 +13,15 @@
 #define ALERTMOD_HOSTSVC_PROCESS_SERVICE_H_
 
 #include <chrono>
-#include <condition_variable>
 #include <cstddef>
 #include <cstdint>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <vector>
 
 #include "alertmod/host_records.h"
+#include "alertmod/platform/mutex.h"
+#include "alertmod/platform/thread_annotations.h"
 
 namespace hx {
 namespace ipc {
@@ -49,19 +49,51 @@ struct ProcessOptions {
   std::string secondText;  // sent before the program when flag 16 is set
 };
 
-// One program run, shared between its caller and the registry. The fields
-// below `condition` are guarded by `lock`; state, id and value are written
-// under it too and read by the caller under it.
+// One program run, shared between its caller and the registry. Its state
+// and output change under its own lock, and every change wakes its waiters.
 class client {
  public:
-  int32_t state = kStateStarting;
-  uint32_t id = 0;
-  int32_t value = 0;
-  std::mutex lock;
-  std::condition_variable condition;  // broadcast after every message
-  std::string standardOutput;         // unread output of type 1, without CR
-  std::string standardError;          // unread output of type 2, without CR
-  bool endInputAtWait = false;
+  int32_t State() const EXCLUDES(m_lock);
+  uint32_t Id() const EXCLUDES(m_lock);
+  // The process id the host reported at the start, or the exit code.
+  int32_t Value() const EXCLUDES(m_lock);
+  // Whether WaitForExit first ends the program's input (".ps1" programs).
+  bool EndsInputAtWait() const EXCLUDES(m_lock);
+
+  void SetState(int32_t state) EXCLUDES(m_lock);
+  void SetId(uint32_t id) EXCLUDES(m_lock);
+  void SetEndInputAtWait(bool end) EXCLUDES(m_lock);
+
+  // Applies one of the host's messages to the run (output, running, failed
+  // or exited), without its carriage returns. Returns true when the run
+  // has ended.
+  bool Apply(uint32_t type, int32_t value, const char* payload, size_t length) EXCLUDES(m_lock);
+  // Marks the run failed unless `settled` says its state stands. Returns
+  // whether it was marked.
+  bool FailUnless(bool (*settled)(int32_t state)) EXCLUDES(m_lock);
+  // Waits up to `timeout` while the state is `state`. Returns whether it
+  // changed.
+  bool WaitWhileIn(int32_t state, std::chrono::milliseconds timeout) EXCLUDES(m_lock);
+  // As ReadOutputLine, for a valid channel.
+  bool ReadLine(std::string& line, int channel) EXCLUDES(m_lock);
+  // Whether the input is to be ended before waiting for the exit; the
+  // answer is true once at most, and only while the program runs.
+  bool TakeEndInputAtWait() EXCLUDES(m_lock);
+  // Waits until the program is no longer running.
+  void WaitUntilNotRunning() EXCLUDES(m_lock);
+  // Hands over the unread standard output, when `output` is given. Returns
+  // true with the exit code when the program ran to its end.
+  bool TakeResult(int32_t& exitCode, std::string* output) EXCLUDES(m_lock);
+
+ private:
+  mutable Mutex m_lock;
+  ConditionVariable m_changed;
+  int32_t m_state GUARDED_BY(m_lock) = kStateStarting;
+  uint32_t m_id GUARDED_BY(m_lock) = 0;
+  int32_t m_value GUARDED_BY(m_lock) = 0;
+  std::string m_standardOutput GUARDED_BY(m_lock);  // unread output of type 1
+  std::string m_standardError GUARDED_BY(m_lock);   // unread output of type 2
+  bool m_endInputAtWait GUARDED_BY(m_lock) = false;
 };
 
 // How long a start waits for the host's answer before the program counts as

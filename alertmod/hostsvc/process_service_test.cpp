@@ -131,59 +131,61 @@ TEST_F(ProcessServiceTest, StartSendsCommandAndFlags) {
     EXPECT_EQ(start.substr(16), c.payload);
     EXPECT_EQ(HeaderOf(start).length, start.size());
     EXPECT_EQ(HeaderOf(start).value, c.options.flags);
-    EXPECT_EQ(process->state, kStateRunning);
-    EXPECT_EQ(process->endInputAtWait, c.endInputAtWait) << c.payload;
-    EXPECT_EQ(Deliver(Message(process->id, 5, 0)), 1);
+    EXPECT_EQ(process->State(), kStateRunning);
+    EXPECT_EQ(process->EndsInputAtWait(), c.endInputAtWait) << c.payload;
+    EXPECT_EQ(Deliver(Message(process->Id(), 5, 0)), 1);
   }
 }
 
 TEST_F(ProcessServiceTest, FailedStarts) {
   // No arguments: nothing is sent.
-  EXPECT_EQ(StartProcess(Opts({}))->state, kStateFailed);
+  EXPECT_EQ(StartProcess(Opts({}))->State(), kStateFailed);
   EXPECT_TRUE(service().Messages().empty());
 
   // The host answers "failed": its value is kept and the id forgotten.
   std::shared_ptr<client> failed = Start(Opts({"/missing"}), 4, 2);
-  EXPECT_EQ(failed->state, kStateFailed);
-  EXPECT_EQ(failed->value, 2);
-  EXPECT_EQ(Deliver(Message(failed->id, 5, 0)), 0);
+  EXPECT_EQ(failed->State(), kStateFailed);
+  EXPECT_EQ(failed->Value(), 2);
+  EXPECT_EQ(Deliver(Message(failed->Id(), 5, 0)), 0);
 
   // The host takes the start and never answers: once the answer is overdue
   // the start has failed, and a late answer is dropped.
   SetStartAnswerTimeout(std::chrono::milliseconds(50));
   std::shared_ptr<client> unanswered = StartProcess(Opts({"/bin/true"}));
   SetStartAnswerTimeout(kDefaultStartAnswerTimeout);
-  EXPECT_EQ(unanswered->state, kStateFailed);
-  EXPECT_EQ(Deliver(Message(unanswered->id, 3, 0)), 0);
+  EXPECT_EQ(unanswered->State(), kStateFailed);
+  EXPECT_EQ(Deliver(Message(unanswered->Id(), 3, 0)), 0);
 
   // The host refuses the request: the id is never registered.
   service().SetAccept(false);
   std::shared_ptr<client> refused = StartProcess(Opts({"/bin/true"}));
-  EXPECT_EQ(refused->state, kStateFailed);
-  EXPECT_EQ(Deliver(Message(refused->id, 3, 0)), 0);
+  EXPECT_EQ(refused->State(), kStateFailed);
+  EXPECT_EQ(Deliver(Message(refused->Id(), 3, 0)), 0);
 
   // No send function.
   RegisterProcessService(kModuleId, nullptr);
-  EXPECT_EQ(StartProcess(Opts({"/bin/true"}))->state, kStateFailed);
+  EXPECT_EQ(StartProcess(Opts({"/bin/true"}))->State(), kStateFailed);
 }
 
 TEST_F(ProcessServiceTest, MalformedMessagesAreIgnored) {
   std::shared_ptr<client> process = Start(Opts({"p"}));
-  const std::string header = Message(process->id, 1, 0, "x");
+  const std::string header = Message(process->Id(), 1, 0, "x");
   // Exactly as long as given, so that a read past it is caught.
   for (size_t length = 0; length < 16; ++length) {
     std::vector<char> shortMessage(header.begin(), header.begin() + length);
     EXPECT_EQ(OnProcessMessage(length ? shortMessage.data() : nullptr, length), 0) << length;
   }
   EXPECT_EQ(OnProcessMessage(nullptr, 20), 0);
-  EXPECT_EQ(Deliver(Message(process->id, 0, 0, "x")), 0);
-  EXPECT_EQ(Deliver(Message(process->id, 6, 0, "x")), 0);
-  EXPECT_EQ(Deliver(Message(process->id + 1, 1, 0, "x")), 0);
+  EXPECT_EQ(Deliver(Message(process->Id(), 0, 0, "x")), 0);
+  EXPECT_EQ(Deliver(Message(process->Id(), 6, 0, "x")), 0);
+  EXPECT_EQ(Deliver(Message(process->Id() + 1, 1, 0, "x")), 0);
   // The header's own length is not consulted.
-  std::string lying = Message(process->id, 1, 0, "ok\n");
+  std::string lying = Message(process->Id(), 1, 0, "ok\n");
   lying[0] = 99;
   EXPECT_EQ(Deliver(lying), 1);
-  EXPECT_EQ(process->standardOutput, "ok\n");
+  std::string line;
+  EXPECT_TRUE(ReadOutputLine(*process, line, 0));
+  EXPECT_EQ(line, "ok");
 }
 
 TEST_F(ProcessServiceTest, OutputBecomesLines) {
@@ -200,14 +202,14 @@ TEST_F(ProcessServiceTest, OutputBecomesLines) {
   for (const Case& c : cases) {
     std::shared_ptr<client> process = Start(Opts({"p"}));
     for (const std::string& piece : c.pieces) {
-      EXPECT_EQ(Deliver(Message(process->id, 2, 0, piece)), 1);
+      EXPECT_EQ(Deliver(Message(process->Id(), 2, 0, piece)), 1);
     }
-    EXPECT_EQ(Deliver(Message(process->id, 5, 7)), 1);
+    EXPECT_EQ(Deliver(Message(process->Id(), 5, 7)), 1);
     std::vector<std::string> lines;
     std::string line;
     while (ReadOutputLine(*process, line, 1)) lines.push_back(line);
     EXPECT_EQ(lines, c.lines);
-    EXPECT_EQ(process->value, 7);
+    EXPECT_EQ(process->Value(), 7);
     EXPECT_FALSE(ReadOutputLine(*process, line, 2));
   }
 }
@@ -322,9 +324,9 @@ TEST_F(ProcessServiceTest, WaitForExitEndsInputOfPs1Programs) {
   EXPECT_EQ(HeaderOf(end).type, 0u);
   EXPECT_EQ(HeaderOf(end).length, 16u);
   EXPECT_EQ(HeaderOf(end).value, 1u);
-  Deliver(Message(process->id, 5, 0));
+  Deliver(Message(process->Id(), 5, 0));
   waited.get();
-  EXPECT_FALSE(process->endInputAtWait);
+  EXPECT_FALSE(process->EndsInputAtWait());
 }
 
 TEST_F(ProcessServiceTest, ShutdownReleasesWaitersAndRefusesStarts) {
@@ -341,29 +343,29 @@ TEST_F(ProcessServiceTest, ShutdownReleasesWaitersAndRefusesStarts) {
   ShutdownProcessService(true);
   EXPECT_FALSE(run.get());
   EXPECT_EQ(exitCode, -1);
-  EXPECT_EQ(starting.get()->state, kStateFailed);
-  EXPECT_EQ(running->state, kStateFailed);
-  EXPECT_EQ(Deliver(Message(running->id, 5, 0)), 0);
+  EXPECT_EQ(starting.get()->State(), kStateFailed);
+  EXPECT_EQ(running->State(), kStateFailed);
+  EXPECT_EQ(Deliver(Message(running->Id(), 5, 0)), 0);
 
   const size_t sent = service().Messages().size();
-  EXPECT_EQ(StartProcess(Opts({"p"}))->state, kStateFailed);
+  EXPECT_EQ(StartProcess(Opts({"p"}))->State(), kStateFailed);
   EXPECT_FALSE(RunProcess({"p"}, "x", exitCode, errorLines));
   EXPECT_EQ(service().Messages().size(), sent);
 
   // A new Load opens the service again.
   RegisterProcessService(kModuleId, &FakeService::Send);
-  EXPECT_EQ(Start(Opts({"p"}))->state, kStateRunning);
+  EXPECT_EQ(Start(Opts({"p"}))->State(), kStateRunning);
 }
 
 TEST_F(ProcessServiceTest, IdsWrapAroundToTheNextFreeOne) {
   SetLastProcessId(0xC00000 | 0xFFFFE);
   std::shared_ptr<client> last = Start(Opts({"p"}));
-  EXPECT_EQ(last->id, 0xCFFFFFu);
+  EXPECT_EQ(last->Id(), 0xCFFFFFu);
   std::shared_ptr<client> wrapped = Start(Opts({"p"}));
-  EXPECT_EQ(wrapped->id, 0xC00000u);
+  EXPECT_EQ(wrapped->Id(), 0xC00000u);
   // 0xC00000 still runs: the next start after another wrap skips it.
   SetLastProcessId(0xCFFFFF);
-  EXPECT_EQ(Start(Opts({"p"}))->id, 0xC00001u);
+  EXPECT_EQ(Start(Opts({"p"}))->Id(), 0xC00001u);
 }
 
 }  // namespace

@@ -28,7 +28,7 @@ bool ProbeSmtps(NotifyCfg& config) {
   options.arguments = {kTransferTool, "-V"};
   std::shared_ptr<ipc::client> process = ipc::StartProcess(options);
   bool available = false;
-  if (process->state != ipc::kStateFailed) {
+  if (process->State() != ipc::kStateFailed) {
     available = OutputMentions(*process, kSmtpsProtocol);
     ipc::WaitForExit(*process);
   }

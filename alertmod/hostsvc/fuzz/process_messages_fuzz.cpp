@@ -168,14 +168,14 @@ struct RunResult {
 // the wait for the end.
 void DriveStartedProcess(const ipc::ProcessOptions& options, RunResult& result) {
   std::shared_ptr<ipc::client> process = ipc::StartProcess(options);
-  Check(process->state != ipc::kStateStarting);
+  Check(process->State() != ipc::kStateStarting);
   std::string line;
   std::vector<std::string> lines;
   while (ipc::ReadOutputLine(*process, line, 0)) lines.push_back(line);
   ipc::WaitForExit(*process);
-  std::lock_guard<std::mutex> lock(process->lock);
-  Check(process->state != ipc::kStateRunning && process->state != ipc::kStateStarting);
-  result.state = process->state;
+  const int32_t state = process->State();
+  Check(state != ipc::kStateRunning && state != ipc::kStateStarting);
+  result.state = state;
   result.output = Joined(lines);
 }
 
