@@ -2,7 +2,6 @@
 
 #include <cstring>
 #include <limits>
-#include <mutex>
 
 #include "host/system_description.h"
 
@@ -187,7 +186,7 @@ bool CameraFeed::Run(std::string* error) {
   m_start = std::chrono::steady_clock::now();
   for (int loop = 0; m_options.loops == 0 || loop < m_options.loops; ++loop) {
     {
-      std::lock_guard<std::mutex> lock(m_mutex);
+      MutexLock lock(m_mutex);
       if (m_stop) break;
     }
     // Each further round starts from a freshly opened file.
@@ -206,7 +205,7 @@ bool CameraFeed::PlayOnce(std::string* error) {
   const AVRational timeBase = m_demuxer->Stream().time_base;
   for (;;) {
     {
-      std::lock_guard<std::mutex> lock(m_mutex);
+      MutexLock lock(m_mutex);
       if (m_stop) return true;
     }
     const int next = m_demuxer->Next(packet.get(), error);
@@ -223,8 +222,9 @@ bool CameraFeed::PlayOnce(std::string* error) {
 void CameraFeed::Pace() {
   const auto due = m_start + std::chrono::duration_cast<std::chrono::steady_clock::duration>(
                                  std::chrono::duration<double>(m_sequence / m_format.fps));
-  std::unique_lock<std::mutex> lock(m_mutex);
-  m_wake.wait_until(lock, due, [this] { return m_stop; });
+  MutexLock lock(m_mutex);
+  while (!m_stop && m_wake.WaitUntil(m_mutex, due)) {
+  }
 }
 
 void CameraFeed::Push(const uint8_t* payload, size_t size, bool key, int64_t timeMs) {
@@ -233,7 +233,7 @@ void CameraFeed::Push(const uint8_t* payload, size_t size, bool key, int64_t tim
   if (size <= std::numeric_limits<uint32_t>::max() - kHeader)
     buffer = m_pool.Allocate(kHeader + size);
   if (buffer == nullptr) {
-    std::lock_guard<std::mutex> lock(m_statsMutex);
+    MutexLock lock(m_statsMutex);
     ++m_stats.failed;
     return;
   }
@@ -248,7 +248,7 @@ void CameraFeed::Push(const uint8_t* payload, size_t size, bool key, int64_t tim
   if (size > 0) std::memcpy(buffer + kHeader, payload, size);
   if (m_options.observer) m_options.observer(header, buffer + kHeader);
   const bool kept = WriteFrame(buffer, static_cast<uint32_t>(kHeader + size), key);
-  std::lock_guard<std::mutex> lock(m_statsMutex);
+  MutexLock lock(m_statsMutex);
   ++m_stats.frames;
   if (key) ++m_stats.keyFrames;
   ++(kept ? m_stats.kept : m_stats.refused);
@@ -284,7 +284,7 @@ bool CameraFeed::Start(std::string* error) {
   m_thread = std::thread([this] {
     std::string runError;
     const bool result = Run(&runError);
-    std::lock_guard<std::mutex> lock(m_mutex);
+    MutexLock lock(m_mutex);
     m_result = result;
     m_error = runError;
   });
@@ -293,22 +293,22 @@ bool CameraFeed::Start(std::string* error) {
 
 bool CameraFeed::Wait(std::string* error) {
   if (m_thread.joinable()) m_thread.join();
-  std::lock_guard<std::mutex> lock(m_mutex);
+  MutexLock lock(m_mutex);
   if (error != nullptr) *error = m_error;
   return m_result;
 }
 
 void CameraFeed::Stop() {
   {
-    std::lock_guard<std::mutex> lock(m_mutex);
+    MutexLock lock(m_mutex);
     m_stop = true;
   }
-  m_wake.notify_all();
+  m_wake.NotifyAll();
   if (m_thread.joinable()) m_thread.join();
 }
 
 FeedStats CameraFeed::Stats() const {
-  std::lock_guard<std::mutex> lock(m_statsMutex);
+  MutexLock lock(m_statsMutex);
   return m_stats;
 }
 

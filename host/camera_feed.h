@@ -12,16 +12,16 @@
 
 #include <atomic>
 #include <chrono>
-#include <condition_variable>
 #include <cstdint>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <thread>
 
 #include "host/frame_pool.h"
+#include "host/mutex.h"
 #include "host/reference_host.h"
+#include "host/thread_annotations.h"
 
 namespace refhost {
 
@@ -113,15 +113,15 @@ class CameraFeed {
   uint64_t m_sequence = 0;
   std::chrono::steady_clock::time_point m_start;
 
-  std::mutex m_mutex;
-  std::condition_variable m_wake;
-  bool m_stop = false;  // guarded by m_mutex
+  Mutex m_mutex;
+  ConditionVariable m_wake;
+  bool m_stop GUARDED_BY(m_mutex) = false;
   std::thread m_thread;
-  bool m_result = true;
-  std::string m_error;
+  bool m_result GUARDED_BY(m_mutex) = true;
+  std::string m_error GUARDED_BY(m_mutex);
 
-  mutable std::mutex m_statsMutex;
-  FeedStats m_stats;
+  mutable Mutex m_statsMutex;
+  FeedStats m_stats GUARDED_BY(m_statsMutex);
 };
 
 }  // namespace refhost

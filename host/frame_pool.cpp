@@ -20,7 +20,7 @@ uint8_t* FramePool::Allocate(size_t size) {
   if (size == 0) return nullptr;
   auto* buffer = static_cast<uint8_t*>(std::malloc(size));
   if (buffer == nullptr) return nullptr;
-  std::lock_guard<std::mutex> lock(m_mutex);
+  MutexLock lock(m_mutex);
   try {
     m_lent.emplace(buffer, size);
   } catch (const std::bad_alloc&) {
@@ -51,7 +51,7 @@ int32_t FramePool::OnReleaseRequest(const hx::core::HostRequest& request) {
 }
 
 void FramePool::TakeBack(const void* buffer, ReturnKind how) {
-  std::lock_guard<std::mutex> lock(m_mutex);
+  MutexLock lock(m_mutex);
   auto found = m_lent.find(buffer);
   if (found == m_lent.end()) {
     if (m_freed.count(buffer) != 0) {
@@ -75,7 +75,7 @@ void FramePool::TakeBack(const void* buffer, ReturnKind how) {
 }
 
 FramePoolCounts FramePool::Counts() const {
-  std::lock_guard<std::mutex> lock(m_mutex);
+  MutexLock lock(m_mutex);
   return m_counts;
 }
 

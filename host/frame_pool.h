@@ -12,12 +12,13 @@
 
 #include <cstddef>
 #include <cstdint>
-#include <mutex>
 #include <string>
 #include <unordered_map>
 #include <unordered_set>
 
 #include "alertmod/host_records.h"
+#include "host/mutex.h"
+#include "host/thread_annotations.h"
 
 namespace refhost {
 
@@ -42,20 +43,20 @@ class FramePool {
   FramePool& operator=(const FramePool&) = delete;
 
   // A new buffer of `size` bytes, or null when `size` is 0 or memory is short.
-  uint8_t* Allocate(size_t size);
+  uint8_t* Allocate(size_t size) EXCLUDES(m_mutex);
 
   // The module refused the frame in `buffer`: the host frees it at once.
   // Counted like a release when the buffer is not outstanding.
-  void Discard(const void* buffer);
+  void Discard(const void* buffer) EXCLUDES(m_mutex);
 
   // The module returns `buffer`. Frees it when outstanding; otherwise counts
   // a second release or an unknown buffer.
-  void Release(const void* buffer);
+  void Release(const void* buffer) EXCLUDES(m_mutex);
 
   // The class 0x200 handler: Release(request.data). Returns 0.
   int32_t OnReleaseRequest(const hx::core::HostRequest& request);
 
-  FramePoolCounts Counts() const;
+  FramePoolCounts Counts() const EXCLUDES(m_mutex);
 
   // One line describing any fault (buffers outstanding, released twice,
   // unknown), or empty when there is none.
@@ -63,14 +64,14 @@ class FramePool {
 
  private:
   enum class ReturnKind { kRelease, kDiscard };
-  void TakeBack(const void* buffer, ReturnKind how);
+  void TakeBack(const void* buffer, ReturnKind how) EXCLUDES(m_mutex);
 
-  mutable std::mutex m_mutex;
-  std::unordered_map<const void*, size_t> m_lent;  // buffer -> size
+  mutable Mutex m_mutex;
+  std::unordered_map<const void*, size_t> m_lent GUARDED_BY(m_mutex);  // buffer -> size
   // Freed buffers, to tell a second release from an unknown one. An address
   // leaves the set when the allocator hands it out again.
-  std::unordered_set<const void*> m_freed;
-  FramePoolCounts m_counts;
+  std::unordered_set<const void*> m_freed GUARDED_BY(m_mutex);
+  FramePoolCounts m_counts GUARDED_BY(m_mutex);
 };
 
 }  // namespace refhost

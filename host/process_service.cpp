@@ -124,11 +124,12 @@ struct ProcessService::Run {
   int stderrFd = -1;
   std::thread thread;
   std::atomic<bool> done{false};
-  std::mutex mutex;  // guards the fields below
-  int stdinFd = -1;
-  std::string input;  // taken from the module, not yet written to the program
-  bool inputEnded = false;
-  bool reaped = false;
+  Mutex mutex;
+  int stdinFd GUARDED_BY(mutex) = -1;
+  // Taken from the module, not yet written to the program.
+  std::string input GUARDED_BY(mutex);
+  bool inputEnded GUARDED_BY(mutex) = false;
+  bool reaped GUARDED_BY(mutex) = false;
 };
 
 ProcessService::ProcessService(std::string transferTool, DeliverFn deliver)
@@ -163,7 +164,7 @@ int32_t ProcessService::Start(uint32_t id, uint32_t flags, const char* payload, 
   if (arguments.empty()) return -1;
   if (arguments[0] == kTransferToolName) arguments[0] = m_transferTool;
 
-  std::lock_guard<std::mutex> lock(m_mutex);
+  MutexLock lock(m_mutex);
   if (m_stopping.load() || m_running.count(id) != 0) return -1;
   auto run = std::make_shared<Run>(id);
   Launch(*run, arguments);
@@ -186,7 +187,10 @@ void ProcessService::Launch(Run& run, std::vector<std::string>& arguments) {
   CloseFd(pipes[0][0]);
   CloseFd(pipes[1][1]);
   CloseFd(pipes[2][1]);
-  run.stdinFd = pipes[0][1];
+  {
+    MutexLock lock(run.mutex);
+    run.stdinFd = pipes[0][1];
+  }
   run.stdoutFd = pipes[1][0];
   run.stderrFd = pipes[2][0];
   // Without a process descriptor the run ends when both outputs close.
@@ -196,13 +200,13 @@ void ProcessService::Launch(Run& run, std::vector<std::string>& arguments) {
 int32_t ProcessService::Input(uint32_t id, const char* payload, size_t length, bool last) {
   std::shared_ptr<Run> run;
   {
-    std::lock_guard<std::mutex> lock(m_mutex);
+    MutexLock lock(m_mutex);
     auto found = m_running.find(id);
     if (found == m_running.end()) return 0;
     run = found->second;
   }
   {
-    std::lock_guard<std::mutex> lock(run->mutex);
+    MutexLock lock(run->mutex);
     if (run->inputEnded) return 0;
     run->input.append(payload, length);
     run->inputEnded = last;
@@ -214,7 +218,7 @@ int32_t ProcessService::Input(uint32_t id, const char* payload, size_t length, b
 }
 
 void ProcessService::FeedInput(Run& run) {
-  std::lock_guard<std::mutex> lock(run.mutex);
+  MutexLock lock(run.mutex);
   while (!run.input.empty() && run.stdinFd >= 0) {
     ssize_t n = write(run.stdinFd, run.input.data(), run.input.size());
     if (n > 0) {
@@ -248,16 +252,16 @@ bool ProcessService::ForwardOutput(Run& run, int& fd, uint32_t type) {
 // Without a process descriptor the end is seen when both outputs close.
 void ProcessService::PumpUntilExit(Run& run) {
   for (;;) {
-    bool inputPending;
+    int pendingInputFd = -1;
     {
-      std::lock_guard<std::mutex> lock(run.mutex);
-      inputPending = !run.input.empty() && run.stdinFd >= 0;
+      MutexLock lock(run.mutex);
+      if (!run.input.empty()) pendingInputFd = run.stdinFd;
     }
     pollfd fds[5] = {{run.pidFd, POLLIN, 0},
                      {run.wakeFd, POLLIN, 0},
                      {run.stdoutFd, POLLIN, 0},
                      {run.stderrFd, POLLIN, 0},
-                     {inputPending ? run.stdinFd : -1, POLLOUT, 0}};
+                     {pendingInputFd, POLLOUT, 0}};
     if (poll(fds, 5, -1) < 0 && errno != EINTR) return;
     if (fds[1].revents != 0) {
       uint64_t count = 0;
@@ -278,7 +282,10 @@ void ProcessService::Pump(const std::shared_ptr<Run>& run) {
     return;
   }
   BlockBrokenPipeSignal();
-  SetNonBlocking(run->stdinFd);
+  {
+    MutexLock lock(run->mutex);
+    SetNonBlocking(run->stdinFd);
+  }
   SetNonBlocking(run->stdoutFd);
   SetNonBlocking(run->stderrFd);
   Deliver(run->id, core::kProcessRunning, run->pid, nullptr, 0);
@@ -296,7 +303,7 @@ void ProcessService::Pump(const std::shared_ptr<Run>& run) {
   }
   int status = 0;
   {
-    std::lock_guard<std::mutex> lock(run->mutex);
+    MutexLock lock(run->mutex);
     while (waitpid(run->pid, &status, 0) < 0 && errno == EINTR) {
     }
     run->reaped = true;
@@ -309,7 +316,7 @@ void ProcessService::Finish(const std::shared_ptr<Run>& run, uint32_t type, int3
   {
     // Forgotten before the module hears of the end, so that the id is free
     // again when the module reuses it.
-    std::lock_guard<std::mutex> lock(m_mutex);
+    MutexLock lock(m_mutex);
     auto found = m_running.find(run->id);
     if (found != m_running.end() && found->second == run) m_running.erase(found);
   }
@@ -331,7 +338,7 @@ void ProcessService::Deliver(uint32_t id, uint32_t type, int32_t value, const ch
 void ProcessService::ReapFinishedRuns() {
   std::vector<std::shared_ptr<Run>> finished;
   {
-    std::lock_guard<std::mutex> lock(m_mutex);
+    MutexLock lock(m_mutex);
     for (auto it = m_runs.begin(); it != m_runs.end();) {
       if ((*it)->done.load()) {
         finished.push_back(*it);
@@ -347,11 +354,11 @@ void ProcessService::ReapFinishedRuns() {
 void ProcessService::Stop() {
   std::vector<std::shared_ptr<Run>> runs;
   {
-    std::lock_guard<std::mutex> lock(m_mutex);
+    MutexLock lock(m_mutex);
     m_stopping.store(true);
     for (auto& entry : m_running) {
       Run& run = *entry.second;
-      std::lock_guard<std::mutex> runLock(run.mutex);
+      MutexLock runLock(run.mutex);
       // Until it is reaped the program's id cannot name another process.
       if (!run.reaped) kill(-run.pid, SIGKILL);
     }
@@ -365,7 +372,7 @@ void ProcessService::Stop() {
 
 size_t ProcessService::ActiveRuns() {
   ReapFinishedRuns();
-  std::lock_guard<std::mutex> lock(m_mutex);
+  MutexLock lock(m_mutex);
   return m_runs.size();
 }
 

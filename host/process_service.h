@@ -23,11 +23,12 @@
 #include <functional>
 #include <map>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <vector>
 
 #include "alertmod/host_records.h"
+#include "host/mutex.h"
+#include "host/thread_annotations.h"
 
 namespace refhost {
 
@@ -80,10 +81,12 @@ class ProcessService {
 
   std::string m_transferTool;
   DeliverFn m_deliver;
-  std::mutex m_mutex;  // guards the maps; held while a program is spawned
+  Mutex m_mutex;  // held while a program is spawned
   std::atomic<bool> m_stopping{false};
-  std::map<uint32_t, std::shared_ptr<Run>> m_running;  // by id, until the program ends
-  std::vector<std::shared_ptr<Run>> m_runs;            // until their threads are joined
+  // By id, until the program ends.
+  std::map<uint32_t, std::shared_ptr<Run>> m_running GUARDED_BY(m_mutex);
+  // Until their threads are joined.
+  std::vector<std::shared_ptr<Run>> m_runs GUARDED_BY(m_mutex);
 };
 
 }  // namespace refhost
