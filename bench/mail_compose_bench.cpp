@@ -48,7 +48,7 @@ std::string ReferenceEncoding(const std::string& bytes) {
         EVP_EncodeBlock(line.data(), reinterpret_cast<const unsigned char*>(bytes.data()) + offset,
                         static_cast<int>(piece));
     text.append(reinterpret_cast<const char*>(line.data()), length);
-    if (piece % 3 == 0) text += '\n';
+    if (piece % 3 == 0) text += "\r\n";
   }
   return text;
 }
