@@ -10,6 +10,10 @@
 namespace hx {
 namespace platform {
 
+// The file name of major version `major` of the library `baseName`:
+// "lib<baseName>.so.<major>" on Linux, "<baseName>-<major>.dll" on Windows.
+std::string SharedLibraryFileName(const std::string& baseName, int major);
+
 // Loads the library `path` with every symbol bound now and kept local. A
 // name without a slash is looked up along the system's search path. Returns
 // the library's handle, or null when it cannot be loaded.

@@ -23,7 +23,11 @@ bool Status::IsNotFound() const {
 }
 
 bool Status::IsNoSpace() const {
-  return m_code == ENOSPC || m_code == EDQUOT;
+// A quota is reported as its own error only where the C runtime has one.
+#ifdef EDQUOT
+  if (m_code == EDQUOT) return true;
+#endif
+  return m_code == ENOSPC;
 }
 
 std::string Status::SystemText() const {

@@ -20,7 +20,7 @@ namespace {
 std::string LibraryPath(const std::string& directory, const char* baseName, int major) {
   std::string path = directory;
   if (!path.empty() && path.back() != '/') path.push_back('/');
-  return path + "lib" + baseName + ".so." + std::to_string(major);
+  return path + platform::SharedLibraryFileName(baseName, major);
 }
 
 // The libraries' log callback is one per process and carries no context of

@@ -11,7 +11,8 @@
 // only on the notification worker, which writes one clip at a time, and
 // every user checks AllLoaded() before calling through a pointer.
 //
-// Each library is the file "lib<base>.so.<major>" of the major version the
+// Each library is the file of the major version (platform::SharedLibraryFileName:
+// "lib<base>.so.<major>" on Linux, "<base>-<major>.dll" on Windows) the
 // module was compiled for, and must report that version: the module reads
 // the libraries' structures with the layout of its own headers, so no other
 // release will do.
@@ -74,7 +75,7 @@ class LibWrapper {
   void SetDirectory(const std::string& directory) { m_directory = directory; }
 
  protected:
-  // Loads "lib<baseName>.so.<builtMajor>"; once loaded it replaces the file
+  // Loads the file of `baseName` and `builtMajor`; once loaded it replaces the file
   // loaded before. Returns true when it has every required symbol and its
   // `versionSymbol` reports `builtMajor`; a file of another major is freed
   // again. A file lacking a symbol stays loaded and the result is false.

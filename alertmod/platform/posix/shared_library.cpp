@@ -5,6 +5,10 @@
 namespace hx {
 namespace platform {
 
+std::string SharedLibraryFileName(const std::string& baseName, int major) {
+  return "lib" + baseName + ".so." + std::to_string(major);
+}
+
 void* OpenSharedLibrary(const std::string& path) {
   // Local binding keeps the codec libraries' symbols out of the host's
   // namespace; binding now surfaces a broken library at load, not mid-clip.
