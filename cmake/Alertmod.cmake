@@ -23,7 +23,12 @@ function(alertmod_unit_tests library)
   if(ARG_THREADED)
     list(APPEND labels threaded)
   endif()
-  gtest_discover_tests(${target} DISCOVERY_MODE PRE_TEST
+  # Under Wine the first listing also creates the Wine prefix.
+  set(discovery_timeout 5)
+  if(WIN32)
+    set(discovery_timeout 60)
+  endif()
+  gtest_discover_tests(${target} DISCOVERY_MODE PRE_TEST DISCOVERY_TIMEOUT ${discovery_timeout}
                        PROPERTIES LABELS "${labels}" TIMEOUT 120)
 endfunction()
 

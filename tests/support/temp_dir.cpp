@@ -1,24 +1,34 @@
 #include "tests/support/temp_dir.h"
 
-#include <sys/stat.h>
-#include <unistd.h>
-
-#include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <random>
 #include <sstream>
 #include <stdexcept>
-#include <vector>
 
 namespace testsupport {
+namespace {
 
+constexpr int kNameAttempts = 100;
+
+}  // namespace
+
+// std::filesystem, not mkdtemp, so that the Windows build of the tests has
+// the same helper: its temp_directory_path honours TMPDIR here and answers
+// GetTempPath there.
 TempDir::TempDir() {
-  const char* base = getenv("TMPDIR");
-  std::string pattern = std::string(base && *base ? base : "/tmp") + "/alertmod-test-XXXXXX";
-  std::vector<char> buffer(pattern.begin(), pattern.end());
-  buffer.push_back('\0');
-  if (mkdtemp(buffer.data()) == nullptr) throw std::runtime_error("mkdtemp failed");
-  m_path = buffer.data();
+  const std::filesystem::path base = std::filesystem::temp_directory_path();
+  std::random_device seed;
+  std::mt19937 random(seed());
+  for (int attempt = 0; attempt < kNameAttempts; ++attempt) {
+    const std::filesystem::path candidate = base / ("alertmod-test-" + std::to_string(random()));
+    std::error_code error;
+    if (std::filesystem::create_directory(candidate, error)) {
+      m_path = candidate.string();
+      return;
+    }
+  }
+  throw std::runtime_error("cannot create a temporary directory under " + base.string());
 }
 
 TempDir::~TempDir() {
@@ -29,15 +39,16 @@ TempDir::~TempDir() {
 }
 
 ScopedChdir::ScopedChdir(const std::string& dir) {
-  char buffer[4096];
-  if (getcwd(buffer, sizeof(buffer)) != nullptr) m_previous = buffer;
-  if (chdir(dir.c_str()) != 0) throw std::runtime_error("chdir failed: " + dir);
+  std::error_code error;
+  m_previous = std::filesystem::current_path(error).string();
+  std::filesystem::current_path(dir, error);
+  if (error) throw std::runtime_error("chdir failed: " + dir);
 }
 
 ScopedChdir::~ScopedChdir() {
-  if (!m_previous.empty() && chdir(m_previous.c_str()) != 0) {
-    // Nothing sensible to do in a destructor; the next test sets its own.
-  }
+  // Nothing sensible to do on failure in a destructor; the next test sets its own.
+  std::error_code ignored;
+  if (!m_previous.empty()) std::filesystem::current_path(m_previous, ignored);
 }
 
 std::string ReadFile(const std::string& path) {
@@ -54,8 +65,8 @@ bool WriteFile(const std::string& path, const std::string& content) {
 }
 
 bool FileExists(const std::string& path) {
-  struct stat info {};
-  return stat(path.c_str(), &info) == 0;
+  std::error_code ignored;
+  return std::filesystem::exists(path, ignored);
 }
 
 }  // namespace testsupport

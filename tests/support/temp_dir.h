@@ -1,5 +1,6 @@
-// A fresh directory under TMPDIR (or /tmp), removed with its content when the
-// object goes. ScopedChdir makes it the working directory for a test.
+// A fresh directory under the temporary folder (TMPDIR or /tmp; on Windows
+// GetTempPath), removed with its content when the object goes. ScopedChdir
+// makes it the working directory for a test.
 #ifndef ALERTMOD_TESTS_SUPPORT_TEMP_DIR_H_
 #define ALERTMOD_TESTS_SUPPORT_TEMP_DIR_H_
 
