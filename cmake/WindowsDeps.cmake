@@ -48,6 +48,19 @@ set(ALERTMOD_WINDOWS_SKIPPED_TESTS
   # Opens the stand-in codec libraries with dlopen.
   av_libs_test.cpp)
 
+# Test cases (gtest patterns) that cannot pass under Wine.
+set(ALERTMOD_WINDOWS_SKIPPED_CASES
+  # Counts the open descriptors in Linux's /proc/self/fd, which under Wine
+  # are Wine's own.
+  FilesTest.AMovedFileIsClosedOnceByItsLastOwner
+  # Need the ffmpeg and ffprobe programs and FFmpeg's DLLs for Windows, which
+  # Debian does not ship.
+  StreamMuxerTest.* ClipWriterTest.*
+  # Pin Linux's error numbers and texts ("111: ... Connection refused"); on
+  # Windows the log carries Winsock's (10061), and Wine has no text for them.
+  WebLinkTest.UnreachableServerIsLoggedWithItsError WebLinkTest.SilentServerEndsAtTheTimeout
+  HttpGetClientTest.SilentServerTimesOut)
+
 # The parts of the reference host that the unit tests use and that build for
 # Windows: the system descriptions (the password service needs OpenSSL).
 add_library(alertmod_host_system STATIC ${PROJECT_SOURCE_DIR}/host/system_description.cpp)

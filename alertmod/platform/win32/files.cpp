@@ -153,9 +153,19 @@ Status RenameReplacing(const std::string& from, const std::string& to) {
   return Win32Failure("cannot rename " + Quoted(from) + " to " + Quoted(to), GetLastError());
 }
 
-Status SyncParentDirectory(const std::string& /*path*/) {
+Status SyncParentDirectory(const std::string& path) {
   // Windows has no handle on a directory's entries to flush; the
-  // write-through rename above has already put the entry on the disk.
+  // write-through rename has already put the entry on the disk. What is
+  // left is to report a directory that is not there.
+  const std::string::size_type slash = path.find_last_of("/\\");
+  const std::string dir = slash == std::string::npos ? "." : path.substr(0, slash + 1);
+  const DWORD attributes = GetFileAttributesA(dir.c_str());
+  if (attributes == INVALID_FILE_ATTRIBUTES) {
+    return Win32Failure("cannot sync " + Quoted(dir), GetLastError());
+  }
+  if ((attributes & FILE_ATTRIBUTE_DIRECTORY) == 0) {
+    return Status::FromErrno("cannot sync " + Quoted(dir), ENOTDIR);
+  }
   return Status::OK();
 }
 
