@@ -9,8 +9,12 @@ function(alertmod_unit_tests library)
   if(ALERTMOD_SANITIZE STREQUAL "thread" AND NOT ARG_THREADED)
     return()
   endif()
+  # Test sources named *_windows_test.cpp check Windows behaviour and are
+  # built for Windows only.
   if(WIN32)
     list(REMOVE_ITEM ARG_TESTS ${ALERTMOD_WINDOWS_SKIPPED_TESTS})
+  else()
+    list(FILTER ARG_TESTS EXCLUDE REGEX "_windows_test\\.cpp$")
   endif()
   if(NOT ARG_TESTS)
     return()

@@ -7,6 +7,7 @@
 #include "alertmod/diag/log.h"
 #include "alertmod/mail/delivery_test_util.h"
 #include "alertmod/mail/mail_file.h"
+#include "alertmod/video/av_libs.h"
 #include "alertmod/video/video_email_stream.h"
 #include "tests/support/temp_dir.h"
 
@@ -159,6 +160,22 @@ TEST_F(NotificationJobTest, UnpreparedAttachmentLeavesALineInTheBody) {
   EXPECT_TRUE(m_host.Log().Contains("Failed to prepare video attachment for source: \"Empty\", "));
   EXPECT_TRUE(m_host.Log().Contains("Failed to prepare video attachment for source: \"Broken\", "));
   EXPECT_EQ(m_writer.paths.size(), 1u) << "a clip without frames is not even written";
+}
+
+// Without the codec libraries (on Windows: no avcodec-59.dll and its kin
+// where the module looks) the mail still goes, without its clip.
+TEST_F(NotificationJobTest, MissingCodecLibrariesLeaveTheClipOut) {
+  av_init::Instance().SetLibraryDirectory(m_dir.File("no-codecs"));
+  av_init::Instance().Reload();
+  AddSource("Lobby", Clip(5, {0, 40}, 100, 0));
+  RunNotificationJob(m_item, m_helper, m_stream, 100, *MakeAttachmentWriter(m_host.callback()));
+  av_init::Instance().SetLibraryDirectory("");
+  ASSERT_EQ(m_helper.messages.size(), 1u);
+  EXPECT_NE(m_helper.messages[0].find("- Failed to prepare video attachment for source: "
+                                      "\"Lobby\", "),
+            std::string::npos)
+      << m_helper.messages[0];
+  EXPECT_EQ(m_helper.messages[0].find("Content-Disposition"), std::string::npos);
 }
 
 TEST_F(NotificationJobTest, AWriterThatLeavesNoBytesAttachesNothing) {
