@@ -27,7 +27,9 @@ function(alertmod_unit_tests library)
   if(ARG_THREADED)
     list(APPEND labels threaded)
   endif()
-  # Under Wine the first listing also creates the Wine prefix.
+  # One CTest test per case, as on Linux: the cases of a program rely on
+  # running in a process of their own. Under Wine the first listing also
+  # creates the Wine prefix.
   set(discovery_timeout 5)
   set(filter "*")
   if(WIN32)
