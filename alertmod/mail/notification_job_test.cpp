@@ -65,7 +65,8 @@ std::shared_ptr<CVideoEmailStream> Clip(uint32_t codec, std::vector<uint32_t> ar
 
 class NotificationJobTest : public ::testing::Test {
  protected:
-  NotificationJobTest() : m_chdir(m_dir.path()), m_helper(m_host), m_stream(m_host.callback()) {
+  NotificationJobTest()
+      : m_chdir(m_dir.path()), m_helper(m_host), m_stream(m_host.callback(), m_env) {
     m_item.profile.id = 3;
     m_item.profile.description = "Lobby";
     m_item.profile.from = "alarm@example.com";
@@ -95,6 +96,7 @@ class NotificationJobTest : public ::testing::Test {
   testsupport::TempDir m_dir;
   testsupport::ScopedChdir m_chdir;
   testsupport::FakeHost m_host;
+  platform::ManualEnv m_env;
   ScriptedHelper m_helper;
   NotifyFileStreamImpl m_stream;
   RecordingWriter m_writer;
