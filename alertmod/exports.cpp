@@ -83,10 +83,13 @@ int32_t Load(hx::core::LoadParmsIn* in, hx::core::LoadParmsOut* out) {
     HostCallbackFn callback = in->callback;
     g_hostCallback.store(callback);
     if (hx::CurrentManager() == nullptr) {
-      hx::SetCurrentManager(new hx::NotifyManager(callback, hx::DefaultWorkerJobFactory(callback)));
+      hx::platform::Env& env = hx::EnvForLoad();
+      hx::SetCurrentManager(
+          new hx::NotifyManager(callback, env, hx::DefaultWorkerJobFactory(callback, env)));
     }
     if (out != nullptr) FillLoadParmsOut(out);
-    hx::ipc::RegisterProcessService(kModuleId, &SendProcessMessageToHost, callback);
+    hx::ipc::RegisterProcessService(kModuleId, &SendProcessMessageToHost, callback,
+                                    hx::EnvForLoad());
   });
 }
 

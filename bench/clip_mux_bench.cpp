@@ -10,6 +10,7 @@
 #include <memory>
 #include <string>
 
+#include "alertmod/platform/testing/manual_env.h"
 #include "alertmod/video/clip_writer.h"
 #include "alertmod/video/testing/clip_media.h"
 
@@ -46,7 +47,8 @@ void BM_InProcessMux(benchmark::State& state) {
   }
   const std::string path = media.directory + "/in_process.mov";
   for (auto _ : state) {
-    const bool written = hx::WriteVideoAttachment(1, media.clip->Stream(), path, nullptr);
+    const bool written = hx::WriteVideoAttachment(1, media.clip->Stream(), path, nullptr,
+                                                  *hx::platform::SystemEnvForTests());
     benchmark::DoNotOptimize(written);
   }
   // Without the codec libraries the writer still returns true, having

@@ -17,7 +17,7 @@
 #include <string>
 #include <vector>
 
-#include "alertmod/platform/clock.h"
+#include "alertmod/platform/testing/manual_env.h"
 #include "alertmod/video/video_buffer.h"
 #include "bench/manager_session.h"
 #include "host/system_description.h"
@@ -50,9 +50,6 @@ int32_t HostCallback(hx::core::HostRequest* request, void*) {
 }
 
 uint32_t g_tickMs = 0;
-uint32_t ReadTick(void*) {
-  return g_tickMs;
-}
 
 const uint8_t* SourceFrame() {
   static const std::vector<uint8_t> frame(kFrameBytes, 0x5A);
@@ -71,7 +68,7 @@ void KeepCapturesAttached(hx::VideoBuffer& buffer,
 }
 
 void BM_ZeroCopyIntake(benchmark::State& state) {
-  hx::platform::SetTickSource(&ReadTick, nullptr);
+  hx::platform::ManualEnv env;
   g_lent = LentBuffers{};
   hx::StreamFormat format;
   format.width = 1920;
@@ -80,11 +77,12 @@ void BM_ZeroCopyIntake(benchmark::State& state) {
   const uint8_t* frame = SourceFrame();
   uint64_t captures = 0;
   {
-    hx::VideoBuffer buffer(&HostCallback);
+    hx::VideoBuffer buffer(&HostCallback, env);
     std::array<std::shared_ptr<hx::CVideoEmailStream>, kCaptures> attached;
     uint64_t round = 0;
     for (auto _ : state) {
       g_tickMs += kFrameIntervalMs;
+      env.SetTick(g_tickMs);
       for (int stream = 0; stream < kStreams; ++stream) {
         const uint32_t type = (round + stream) % kKeySpacing == 0 ? hx::kKeyFrameType : 0;
         if (buffer.AddFrame(stream, type, kHeaderBytes, frame, kFrameBytes, format)) {
@@ -96,7 +94,6 @@ void BM_ZeroCopyIntake(benchmark::State& state) {
       KeepCapturesAttached(buffer, attached);
     }
   }
-  hx::platform::SetTickSource(nullptr, nullptr);
   if (g_lent.outstandingBytes != 0) state.SkipWithError("frame buffers were not all returned");
   state.SetItemsProcessed(state.iterations() * kStreams);
   const double bound = (kStreams + 2.0 * kCaptures) * hx::kDefaultVideoBufferBytes;

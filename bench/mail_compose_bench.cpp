@@ -17,6 +17,7 @@
 
 #include "alertmod/mail/mail_file.h"
 #include "alertmod/mail/notify_file_stream.h"
+#include "alertmod/platform/testing/manual_env.h"
 
 namespace {
 
@@ -84,6 +85,8 @@ class Workspace {
   bool m_ok = false;
 };
 
+constexpr int64_t kComposedAt = 1767225600;
+
 void BM_ComposeMailFile(benchmark::State& state) {
   Workspace workspace;
   hx::NotifyWorkItem item(hx::kWorkItemNotification);
@@ -92,9 +95,10 @@ void BM_ComposeMailFile(benchmark::State& state) {
   item.profile.subject = "Motion";
   item.profile.body = "Motion was detected.";
   std::vector<hx::MailAttachment> attachments = {{true, "data/Lobby.jpg", ""}};
-  hx::NotifyFileStreamImpl stream(nullptr);
+  hx::NotifyFileStreamImpl stream(nullptr, *hx::platform::SystemEnvForTests());
   hx::MailFile mail;
-  if (!workspace.ok() || !hx::ComposeMailFile(item, attachments, 0, 1, 0, stream, mail)) {
+  if (!workspace.ok() ||
+      !hx::ComposeMailFile(item, attachments, 0, 1, 0, kComposedAt, stream, mail)) {
     state.SkipWithError("cannot compose");
     return;
   }
@@ -113,7 +117,7 @@ void BM_ComposeMailFile(benchmark::State& state) {
     state.PauseTiming();
     unlink(mail.path.c_str());
     state.ResumeTiming();
-    bool ok = hx::ComposeMailFile(item, attachments, 0, 1, 0, stream, mail);
+    bool ok = hx::ComposeMailFile(item, attachments, 0, 1, 0, kComposedAt, stream, mail);
     benchmark::DoNotOptimize(ok);
   }
   state.SetBytesProcessed(static_cast<int64_t>(state.iterations() * kAttachmentBytes));

@@ -15,6 +15,7 @@
 #include <memory>
 #include <string>
 
+#include "alertmod/platform/testing/manual_env.h"
 #include "host/reference_host.h"
 #include "tests/support/module_hooks.h"
 
@@ -37,12 +38,14 @@ class ManagerSession {
     options.logThreshold = 50;  // the host keeps every line it is sent
     m_host = std::make_unique<refhost::ReferenceHost>(options);
     std::string error;
+    if (!m_host->OpenLibrary(&error)) return;
+    auto installEnv = reinterpret_cast<testhooks::InstallEnvFn>(m_host->Hook("InstallEnv"));
+    if (installEnv == nullptr) return;
+    installEnv(&m_env);
     if (!m_host->LoadModule(&error)) return;
-    auto setTick = reinterpret_cast<testhooks::SetTickSourceFn>(m_host->Hook("SetTickSource"));
     auto drop =
         reinterpret_cast<testhooks::SetWorkerDropsItemsFn>(m_host->Hook("SetWorkerDropsItems"));
-    if (setTick == nullptr || drop == nullptr || !drop()) return;
-    setTick([](void* tick) { return static_cast<std::atomic<uint32_t>*>(tick)->load(); }, &m_tick);
+    if (drop == nullptr || !drop()) return;
     m_host->OpenModule();
     m_host->LendThreads();
     m_ready = true;
@@ -50,8 +53,8 @@ class ManagerSession {
   ~ManagerSession() {
     if (m_host) {
       m_host->Stop();
-      auto setTick = reinterpret_cast<testhooks::SetTickSourceFn>(m_host->Hook("SetTickSource"));
-      if (setTick != nullptr) setTick(nullptr, nullptr);
+      auto installEnv = reinterpret_cast<testhooks::InstallEnvFn>(m_host->Hook("InstallEnv"));
+      if (installEnv != nullptr) installEnv(nullptr);
       m_host.reset();
     }
     if (!m_dir.empty()) {
@@ -62,7 +65,7 @@ class ManagerSession {
 
   bool Ready() const { return m_ready; }
   refhost::ReferenceHost& Host() { return *m_host; }
-  void AdvanceTick(uint32_t ms) { m_tick.fetch_add(ms); }
+  void AdvanceTick(uint32_t ms) { m_env.Advance(std::chrono::milliseconds(ms)); }
 
   // Runs `body` on the dispatcher thread, where the host's Write calls go
   // straight into the module.
@@ -79,7 +82,7 @@ class ManagerSession {
   std::string m_dir;
   std::filesystem::path m_previous;
   std::unique_ptr<refhost::ReferenceHost> m_host;
-  std::atomic<uint32_t> m_tick{0x10000};
+  hx::platform::ManualEnv m_env;
 };
 
 }  // namespace benchsupport

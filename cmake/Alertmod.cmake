@@ -60,6 +60,21 @@ function(alertmod_integration_test name)
                        PROPERTIES LABELS "${labels}" TIMEOUT 300)
 endfunction()
 
+# alertmod_header_root(<library> <folder>)
+# Sources name headers from the project root ("alertmod/<subsystem>/x.h",
+# "host/x.h"). Each library gets an include directory of its own holding one
+# link to its folder under that folder's path from the root, so that a
+# library finds the headers of itself and of the libraries it links, and no
+# others: an include against the layers fails to compile.
+function(alertmod_header_root library folder)
+  file(RELATIVE_PATH path ${PROJECT_SOURCE_DIR} ${folder})
+  get_filename_component(parent ${path} DIRECTORY)
+  set(root ${CMAKE_BINARY_DIR}/include/${library})
+  file(MAKE_DIRECTORY ${root}/${parent})
+  file(CREATE_LINK ${folder} ${root}/${path} SYMBOLIC)
+  target_include_directories(${library} PUBLIC ${root})
+endfunction()
+
 # alertmod_subsystem(<library> SOURCES ... [TESTS ...] [TEST_LIBS ...]
 #                    [DEPS ...] [THREADED])
 # A subsystem's static library from its SOURCES, and its unit tests from its
@@ -68,9 +83,8 @@ endfunction()
 function(alertmod_subsystem library)
   cmake_parse_arguments(ARG "THREADED" "" "SOURCES;TESTS;TEST_LIBS;DEPS" ${ARGN})
   add_library(${library} STATIC ${ARG_SOURCES})
-  # Sources name headers from the project root ("alertmod/<subsystem>/...").
-  target_include_directories(${library} PUBLIC ${PROJECT_SOURCE_DIR})
-  target_link_libraries(${library} PUBLIC ${ARG_DEPS})
+  alertmod_header_root(${library} ${CMAKE_CURRENT_SOURCE_DIR})
+  target_link_libraries(${library} PUBLIC alertmod_records ${ARG_DEPS})
   if(ALERTMOD_FUZZ)
     # Coverage feedback for the fuzz targets that link this library.
     target_compile_options(${library} PRIVATE -fsanitize=fuzzer-no-link)
@@ -92,6 +106,8 @@ function(alertmod_fuzz_target name)
     return()
   endif()
   add_executable(${name} ${ARG_SOURCES})
+  # Fuzz targets use the tests' support, named from the project root.
+  target_include_directories(${name} PRIVATE ${PROJECT_SOURCE_DIR})
   target_compile_options(${name} PRIVATE -fsanitize=fuzzer)
   target_link_options(${name} PRIVATE -fsanitize=fuzzer)
   target_link_libraries(${name} PRIVATE ${ARG_LIBS})

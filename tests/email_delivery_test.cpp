@@ -75,9 +75,6 @@ std::string ConfigurationText(const std::vector<ServerSetting>& servers,
   return xml;
 }
 
-// The free space the module sees on its data volume, set by the test.
-std::atomic<uint64_t> g_freeBytes{uint64_t{1} << 40};
-
 class EmailDeliveryTest : public testsupport::ModuleHostTest {
  protected:
   void Start(const std::vector<ServerSetting>& servers, const ProfileSetting& profile = {},
@@ -85,17 +82,8 @@ class EmailDeliveryTest : public testsupport::ModuleHostTest {
     ASSERT_TRUE(testsupport::WriteFile(
         "notify.xml", ConfigurationText(servers, profile, maxRetryQueue, maxRetrySeconds)));
     Options().transferTool = CopyingTransferTool();
+    clock().SetFreeBytes(uint64_t{1} << 40);
     CreateHost();
-    auto setFree =
-        reinterpret_cast<testhooks::SetFreeBytesQueryFn>(host().Hook("SetFreeBytesQuery"));
-    ASSERT_NE(setFree, nullptr);
-    g_freeBytes = uint64_t{1} << 40;
-    setFree(
-        [](void*, uint64_t* bytes) {
-          *bytes = g_freeBytes.load();
-          return true;
-        },
-        nullptr);
     std::string error;
     ASSERT_TRUE(host().Start(&error)) << error;
   }
@@ -322,7 +310,7 @@ TEST_F(EmailDeliveryTest, LowDiskSpacePurgesAndDiscards) {
   SendTestAlarm();
   ASSERT_TRUE(WaitForStatuses(1));
   EXPECT_EQ(DataFiles().size(), 1u);
-  g_freeBytes = 90ull << 20;
+  clock().SetFreeBytes(90ull << 20);
   SendTestAlarm();
   ASSERT_TRUE(WaitForStatuses(2));
   EXPECT_TRUE(

@@ -67,23 +67,8 @@ std::string NotifyFile(int port) {
 }
 
 // The free space the module sees on its data volume, set by the test.
-std::atomic<uint64_t> g_freeBytes{uint64_t{1} << 40};
-std::atomic<bool> g_freeBytesQueryFails{false};
-
-bool AnswerFreeBytes(void*, uint64_t* bytes) {
-  if (g_freeBytesQueryFails.load()) return false;
-  *bytes = g_freeBytes.load();
-  return true;
-}
-
 class FaultInjectionTest : public managertest::ManagerHostTest {
  protected:
-  void TearDown() override {
-    g_freeBytes = uint64_t{1} << 40;
-    g_freeBytesQueryFails = false;
-    ManagerHostTest::TearDown();
-  }
-
   // A transfer tool that records its process id, runs `before` (shell
   // commands) and then curl. The capability probe ("-V") goes to curl at once.
   std::string ToolScript(const std::string& before = "", const std::string& run = "curl") {
@@ -104,11 +89,8 @@ class FaultInjectionTest : public managertest::ManagerHostTest {
              const std::function<void(refhost::ReferenceHost&)>& prepare = {}) {
     ASSERT_TRUE(testsupport::WriteFile("notify.xml", NotifyFile(port)));
     Options().transferTool = transferTool;
+    clock().SetFreeBytes(uint64_t{1} << 40);
     CreateHost();
-    auto setFree =
-        reinterpret_cast<testhooks::SetFreeBytesQueryFn>(host().Hook("SetFreeBytesQuery"));
-    ASSERT_NE(setFree, nullptr);
-    setFree(&AnswerFreeBytes, nullptr);
     if (prepare) prepare(host());
     std::string error;
     ASSERT_TRUE(host().Start(&error)) << error;
@@ -133,7 +115,7 @@ class FaultInjectionTest : public managertest::ManagerHostTest {
     request.profile = kVideoProfile;
     request.action = kCameraEvent;
     request.time = clock().WallSeconds();
-    alarm.requests = {request};
+    alarm.requests.push_back(std::move(request));
     SendAlarm(alarm);
   }
   void PlainAlarm() { SendAlarm(kPlainProfile, 1); }
@@ -268,11 +250,8 @@ TEST_F(FaultInjectionTest, HostRefusingProcessMessages) {
     SCOPED_TRACE(handling);
     SmtpTestServer smtp;
     std::unique_ptr<refhost::ProcessService> service;
+    clock().SetProcessStartTimeout(std::chrono::milliseconds(300));
     Start(smtp.port(), ToolScript(), [&](refhost::ReferenceHost& host) {
-      auto setStartTimeout = reinterpret_cast<testhooks::SetStartAnswerTimeoutMsFn>(
-          host.Hook("SetStartAnswerTimeoutMs"));
-      ASSERT_NE(setStartTimeout, nullptr);
-      setStartTimeout(300);
       service = std::make_unique<refhost::ProcessService>(
           ToolScript(), [&host](const void* data, uint32_t length) {
             host.Ioctl(hx::core::kIoctlProcessMessage, data, length);
@@ -316,7 +295,7 @@ TEST_F(FaultInjectionTest, FullDiskDiscardsFailuresInsteadOfQueueingThem) {
       "Failed to prepare email notification file. (Profile Description: Front door)"));
   EXPECT_EQ(MessageFiles().size(), 1u) << "the message cut short is removed";
 
-  g_freeBytes = 0;
+  clock().SetFreeBytes(0);
   AlarmWithVideo();
   ASSERT_TRUE(WaitForStatus(1, 3));
   EXPECT_TRUE(
@@ -328,8 +307,8 @@ TEST_F(FaultInjectionTest, FullDiskDiscardsFailuresInsteadOfQueueingThem) {
   EXPECT_EQ(MessageFiles().size(), 1u) << "the small queued message is kept, the new one dropped";
 
   // A volume that cannot be queried counts as having room.
-  g_freeBytes = uint64_t{1} << 40;
-  g_freeBytesQueryFails = true;
+  clock().SetFreeBytes(uint64_t{1} << 40);
+  clock().FailFreeBytesQueries(true);
   PlainAlarm();
   ASSERT_TRUE(WaitForStatus(1, 4));
   EXPECT_TRUE(host().Log().Contains("Exception while query volume space: "));

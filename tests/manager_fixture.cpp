@@ -41,7 +41,11 @@ void ManagerHostTest::Record(const testhooks::WorkItemRecord& record, void* cont
   auto* test = static_cast<ManagerHostTest*>(context);
   {
     std::lock_guard<std::mutex> lock(test->m_mutex);
-    test->m_items.push_back(record);
+    if (record.marker) {
+      ++test->m_markers;
+    } else {
+      test->m_items.push_back(record);
+    }
   }
   test->m_signal.notify_all();
 }
@@ -133,13 +137,21 @@ std::vector<testhooks::WorkItemRecord> ManagerHostTest::Items() {
 }
 
 size_t ManagerHostTest::ItemCountAfterQuiet() {
-  const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
-  while (State().queued != 0 && std::chrono::steady_clock::now() < deadline) {
-    std::this_thread::sleep_for(std::chrono::milliseconds(10));
+  // A marker queued on the dispatcher follows every item that the requests
+  // sent so far queued; once the worker has shown it, it has shown them all.
+  auto queueMarker = reinterpret_cast<testhooks::QueueMarkerFn>(host().Hook("QueueMarker"));
+  EXPECT_NE(queueMarker, nullptr);
+  if (queueMarker == nullptr) return Items().size();
+  size_t markers = 0;
+  {
+    std::lock_guard<std::mutex> lock(m_mutex);
+    markers = m_markers;
   }
-  // The worker takes its last item and shows it to the recorder at once.
-  std::this_thread::sleep_for(std::chrono::milliseconds(200));
-  return Items().size();
+  EXPECT_TRUE(host().GetDispatcher().Call([&] { return queueMarker(); }));
+  std::unique_lock<std::mutex> lock(m_mutex);
+  EXPECT_TRUE(
+      m_signal.wait_for(lock, std::chrono::seconds(20), [&] { return m_markers > markers; }));
+  return m_items.size();
 }
 
 void ManagerHostTest::ExpectFramesReturned() {

@@ -88,6 +88,7 @@ class ManagerHostTest : public testsupport::ModuleHostTest {
   std::mutex m_mutex;
   std::condition_variable m_signal;
   std::vector<testhooks::WorkItemRecord> m_items;
+  size_t m_markers = 0;  // markers the worker has shown
 };
 
 }  // namespace managertest

@@ -46,9 +46,7 @@ class HostProcessTest : public testsupport::ModuleHostTest {
   void Start() {
     StartHost();
     m_run = reinterpret_cast<testhooks::RunProcessFn>(host().Hook("RunProcess"));
-    m_setLastId = reinterpret_cast<testhooks::SetLastProcessIdFn>(host().Hook("SetLastProcessId"));
     ASSERT_NE(m_run, nullptr);
-    ASSERT_NE(m_setLastId, nullptr);
   }
 
   ProcessRunResult Run(const std::vector<std::string>& arguments, const std::string& input = "") {
@@ -99,7 +97,6 @@ class HostProcessTest : public testsupport::ModuleHostTest {
   }
 
   testhooks::RunProcessFn m_run = nullptr;
-  testhooks::SetLastProcessIdFn m_setLastId = nullptr;
 };
 
 TEST_F(HostProcessTest, ProgramsReportOutputAndExitCode) {
@@ -236,24 +233,6 @@ TEST_F(HostProcessTest, LoadAfterStopOpensTheServiceAgain) {
   ProcessRunResult result = Run({"/bin/sh", "-c", "exit 4"});
   EXPECT_TRUE(result.ran);
   EXPECT_EQ(result.exitCode, 4);
-}
-
-TEST_F(HostProcessTest, IdsWrapAroundToTheNextFreeOne) {
-  ASSERT_NO_FATAL_FAILURE(Start());
-  host().Requests().Clear();
-  m_setLastId(0xCFFFFF);
-  auto waiting = RunAsync({"/bin/sh", "-c", "while [ ! -e release ]; do sleep 0.05; done"});
-  ASSERT_TRUE(WaitForSent(0, 1));
-  m_setLastId(0xCFFFFF);
-  EXPECT_TRUE(Run({"/bin/true"}).ran);
-  ASSERT_TRUE(testsupport::WriteFile(dir().File("release"), ""));
-  EXPECT_TRUE(Await(waiting).ran);
-
-  std::vector<uint32_t> startIds;
-  for (const ProcessMessageHeader& message : SentMessages()) {
-    if (message.type == 6) startIds.push_back(message.id);
-  }
-  EXPECT_EQ(startIds, (std::vector<uint32_t>{0xC00000, 0xC00001}));
 }
 
 TEST_F(HostProcessTest, ConcurrentRunsKeepTheirOwnOutput) {

@@ -72,7 +72,7 @@ TEST(VideoHandoffTest, CapturesDroppedOnAnotherThreadReleaseEveryKeptFrameOnce) 
   std::vector<bool> kept;
   uint64_t framesRead = 0;
   {
-    hx::VideoBuffer buffer(host.callback(), 256 * 1024);
+    hx::VideoBuffer buffer(host.callback(), tick, 256 * 1024);
     std::vector<CapturePtr> collecting;
     std::mt19937 random(7);
     Worker worker;

@@ -1,12 +1,11 @@
 #include "alertmod/config/durable_xml.h"
 
-#include <atomic>
 #include <condition_variable>
 #include <mutex>
 #include <set>
 
 #include "alertmod/config/xml_document.h"
-#include "alertmod/platform/file_system.h"
+#include "alertmod/platform/env.h"
 #include "alertmod/platform/files.h"
 
 namespace hx {
@@ -60,25 +59,20 @@ class FileNameLock final {
   std::string m_name;
 };
 
-std::atomic<SideFileSyncedHook> g_sideFileSyncedHook{nullptr};
-
 // Writes `text` into a freshly created side file and forces it to the
 // device. Returns the error text, empty on success. Only the first failure is
 // reported: a close error after a write error says nothing new.
-std::string WriteSideFile(const std::string& sideName, const std::string& text) {
+std::string WriteSideFile(platform::Env& env, const std::string& sideName,
+                          const std::string& text) {
   platform::File file;
-  platform::Status status = platform::File::CreateNew(sideName, &file);
+  platform::Status status = env.NewExclusiveFile(sideName, &file);
   if (!status.ok()) return "create error " + std::to_string(status.code());
   std::string failure;
   size_t written = 0;
   status = file.Write(text.data(), text.size(), &written);
   // Data that never reached the device was not written.
   if (status.ok()) status = file.Sync();
-  if (!status.ok()) {
-    failure = "write error " + std::to_string(status.code());
-  } else if (SideFileSyncedHook hook = g_sideFileSyncedHook.load()) {
-    hook(sideName);
-  }
+  if (!status.ok()) failure = "write error " + std::to_string(status.code());
   status = file.Close();
   if (failure.empty() && !status.ok()) failure = "close error " + std::to_string(status.code());
   if (failure.empty() && written < text.size()) {
@@ -132,11 +126,7 @@ std::string PrintXmlIndented(const TiXmlDocument& document) {
   return printer.Str();
 }
 
-void SetSideFileSyncedHook(SideFileSyncedHook hook) {
-  g_sideFileSyncedHook.store(hook);
-}
-
-bool SaveXmlDurably(const TiXmlDocument& document, const std::string& fileName,
+bool SaveXmlDurably(platform::Env& env, const TiXmlDocument& document, const std::string& fileName,
                     std::string* errorText) {
   const std::string text = PrintXmlIndented(document);
   const std::string sideName = fileName + kPendingSuffix;
@@ -144,14 +134,14 @@ bool SaveXmlDurably(const TiXmlDocument& document, const std::string& fileName,
 
   // A side file left by an interrupted save would make the exclusive create
   // fail; it is stale, since the name is ours now.
-  platform::DeleteFile(sideName);
-  std::string failure = WriteSideFile(sideName, text);
+  env.RemoveFile(sideName);
+  std::string failure = WriteSideFile(env, sideName, text);
   if (!failure.empty()) {
-    platform::DeleteFile(sideName);
+    env.RemoveFile(sideName);
     if (errorText != nullptr) *errorText = failure;
     return false;
   }
-  platform::Status renamed = platform::RenameReplacing(sideName, fileName);
+  platform::Status renamed = env.RenameFile(sideName, fileName);
   if (!renamed.ok()) {
     if (errorText != nullptr) {
       *errorText = "Failed to rename .xml.pending to .xml file " + std::to_string(renamed.code()) +
@@ -161,17 +151,15 @@ bool SaveXmlDurably(const TiXmlDocument& document, const std::string& fileName,
   }
   // The rename is done; a failed directory sync only weakens durability
   // against a power loss, and the file itself is complete either way.
-  platform::SyncParentDirectory(fileName);
+  env.SyncParentDirectory(fileName);
   return true;
 }
 
-bool LoadXmlDurably(TiXmlDocument& document, const std::string& fileName) {
+bool LoadXmlDurably(platform::Env& env, TiXmlDocument& document, const std::string& fileName) {
   const std::string sideName = fileName + kPendingSuffix;
   FileNameLock held(fileName);
   if (LoadCompleteSideFile(document, sideName)) {
-    if (platform::RenameReplacing(sideName, fileName).ok()) {
-      platform::SyncParentDirectory(fileName);
-    }
+    if (env.RenameFile(sideName, fileName).ok()) env.SyncParentDirectory(fileName);
     return true;
   }
   return LoadDocumentFile(document, fileName);

@@ -12,6 +12,8 @@
 
 #include <tinyxml.h>
 
+#include "alertmod/platform/env.h"
+
 namespace hx {
 
 // Suffix of the side file that a save writes before renaming it.
@@ -28,19 +30,14 @@ std::string PrintXmlIndented(const TiXmlDocument& document);
 // W of S bytes", and "Failed to rename .xml.pending to .xml file N - text",
 // which leaves the complete side file for the next load to adopt. The
 // document is const, so the reason cannot live in its error description.
-bool SaveXmlDurably(const TiXmlDocument& document, const std::string& fileName,
+// Files are made, renamed and synced through `env`.
+bool SaveXmlDurably(platform::Env& env, const TiXmlDocument& document, const std::string& fileName,
                     std::string* errorText = nullptr);
 
 // Reads and parses `fileName`, adopting a complete side file first (one that
 // parses and has a root element; it then replaces the target). False when no
 // document could be read and parsed.
-bool LoadXmlDurably(TiXmlDocument& document, const std::string& fileName);
-
-// Test seam: called by a save after the side file reached the storage device
-// and before it is closed and renamed, with the side file's name, while the
-// name is held. Null (the default) calls nothing. Install before saving.
-using SideFileSyncedHook = void (*)(const std::string& sideFileName);
-void SetSideFileSyncedHook(SideFileSyncedHook hook);
+bool LoadXmlDurably(platform::Env& env, TiXmlDocument& document, const std::string& fileName);
 
 }  // namespace hx
 

@@ -10,6 +10,7 @@
 #include <csignal>
 #include <thread>
 
+#include "alertmod/platform/testing/manual_env.h"
 #include "tests/support/temp_dir.h"
 
 namespace hx {
@@ -19,6 +20,23 @@ using testsupport::FileExists;
 using testsupport::ReadFile;
 using testsupport::TempDir;
 using testsupport::WriteFile;
+
+// Calls `before` with the side file's name ahead of each rename, while the
+// save holds the name: after the side file is complete, before it counts.
+class RenameWatchingEnv final : public platform::EnvWrapper {
+ public:
+  explicit RenameWatchingEnv(void (*before)(const std::string&))
+      : EnvWrapper(platform::SystemEnvForTests()), m_before(before) {}
+  platform::Status RenameFile(const std::string& from, const std::string& to) override {
+    m_before(from);
+    return EnvWrapper::RenameFile(from, to);
+  }
+
+ private:
+  void (*const m_before)(const std::string&);
+};
+
+platform::Env* g_env = platform::SystemEnvForTests();
 
 const char kOldText[] = "<?xml version=\"1.0\" ?>\n<Trellan>\n    <Old />\n</Trellan>\n";
 
@@ -61,7 +79,7 @@ TEST(DurableXmlTest, SavePrintsIndentedWithLineFeedsAndLeavesNoSideFile) {
   const std::string target = dir.File("notify.xml");
   ASSERT_TRUE(WriteFile(target, kOldText));
   std::string error;
-  ASSERT_TRUE(SaveXmlDurably(MakeDocument("a"), target, &error)) << error;
+  ASSERT_TRUE(SaveXmlDurably(*g_env, MakeDocument("a"), target, &error)) << error;
   EXPECT_EQ(ReadFile(target), Printed("a"));
   EXPECT_FALSE(FileExists(target + ".pending"));
   struct stat info {};
@@ -102,7 +120,7 @@ TEST(DurableXmlTest, FailedSavesLeaveTheTargetAlone) {
     const std::string target = dir.File("notify.xml");
     c.prepare(target);
     std::string error;
-    EXPECT_FALSE(SaveXmlDurably(MakeDocument("new"), target, &error)) << c.name;
+    EXPECT_FALSE(SaveXmlDurably(*g_env, MakeDocument("new"), target, &error)) << c.name;
     EXPECT_EQ(error, c.expectedError) << c.name;
     EXPECT_EQ(ReadFile(target + c.probe), c.probeText) << c.name;
     EXPECT_EQ(ReadFile(target + ".pending") == Printed("new"), c.sideFileKept) << c.name;
@@ -112,7 +130,7 @@ TEST(DurableXmlTest, FailedSavesLeaveTheTargetAlone) {
 TEST(DurableXmlTest, SaveIntoMissingDirectoryCreatesNothing) {
   TempDir dir;
   std::string error;
-  EXPECT_FALSE(SaveXmlDurably(MakeDocument("a"), dir.File("missing/notify.xml"), &error));
+  EXPECT_FALSE(SaveXmlDurably(*g_env, MakeDocument("a"), dir.File("missing/notify.xml"), &error));
   EXPECT_EQ(error, "create error 2");
   EXPECT_FALSE(FileExists(dir.File("missing")));
 }
@@ -130,7 +148,7 @@ TEST(DurableXmlTest, WriteErrorRemovesTheSideFile) {
     rlimit limit{20, 20};
     setrlimit(RLIMIT_FSIZE, &limit);
     std::string error;
-    bool saved = SaveXmlDurably(MakeDocument("new"), target, &error);
+    bool saved = SaveXmlDurably(*g_env, MakeDocument("new"), target, &error);
     std::string report = (saved ? "saved " : "failed ") + error;
     ssize_t ignored = write(pipeFds[1], report.data(), report.size());
     (void)ignored;
@@ -150,8 +168,8 @@ TEST(DurableXmlTest, CrashBeforeRenameIsAdoptedByTheNextLoad) {
   const std::string target = dir.File("notify.xml");
   ASSERT_TRUE(WriteFile(target, kOldText));
   int status = InChild([&] {
-    SetSideFileSyncedHook([](const std::string&) { raise(SIGKILL); });
-    SaveXmlDurably(MakeDocument("crashed"), target);
+    RenameWatchingEnv crashing([](const std::string&) { raise(SIGKILL); });
+    SaveXmlDurably(crashing, MakeDocument("crashed"), target);
   });
   ASSERT_TRUE(WIFSIGNALED(status));
   ASSERT_EQ(WTERMSIG(status), SIGKILL);
@@ -159,7 +177,7 @@ TEST(DurableXmlTest, CrashBeforeRenameIsAdoptedByTheNextLoad) {
   EXPECT_EQ(ReadFile(target + ".pending"), Printed("crashed"));
 
   TiXmlDocument loaded;
-  ASSERT_TRUE(LoadXmlDurably(loaded, target));
+  ASSERT_TRUE(LoadXmlDurably(*g_env, loaded, target));
   EXPECT_STREQ(
       loaded.RootElement()->FirstChildElement("Notify")->FirstChildElement("Name")->GetText(),
       "crashed");
@@ -179,14 +197,14 @@ TEST(DurableXmlTest, IncompleteSideFilesAreIgnored) {
     ASSERT_TRUE(WriteFile(target, kOldText));
     ASSERT_TRUE(WriteFile(target + ".pending", sideText));
     TiXmlDocument loaded;
-    ASSERT_TRUE(LoadXmlDurably(loaded, target)) << sideText;
+    ASSERT_TRUE(LoadXmlDurably(*g_env, loaded, target)) << sideText;
     ASSERT_NE(loaded.RootElement(), nullptr) << sideText;
     EXPECT_NE(loaded.RootElement()->FirstChildElement("Old"), nullptr) << sideText;
     EXPECT_EQ(ReadFile(target), kOldText);
 
     // The next save replaces the stale side file and then the target.
     std::string error;
-    ASSERT_TRUE(SaveXmlDurably(MakeDocument("next"), target, &error)) << error;
+    ASSERT_TRUE(SaveXmlDurably(*g_env, MakeDocument("next"), target, &error)) << error;
     EXPECT_EQ(ReadFile(target), Printed("next"));
     EXPECT_FALSE(FileExists(target + ".pending"));
   }
@@ -195,9 +213,9 @@ TEST(DurableXmlTest, IncompleteSideFilesAreIgnored) {
 TEST(DurableXmlTest, LoadFailsForMissingOrMalformedFiles) {
   TempDir dir;
   TiXmlDocument document;
-  EXPECT_FALSE(LoadXmlDurably(document, dir.File("notify.xml")));
+  EXPECT_FALSE(LoadXmlDurably(*g_env, document, dir.File("notify.xml")));
   ASSERT_TRUE(WriteFile(dir.File("notify.xml"), "<Trellan><Notify></Trellan>"));
-  EXPECT_FALSE(LoadXmlDurably(document, dir.File("notify.xml")));
+  EXPECT_FALSE(LoadXmlDurably(*g_env, document, dir.File("notify.xml")));
 }
 
 TEST(DurableXmlTest, DirectoriesInPlaceOfTheFilesAreNotRead) {
@@ -207,9 +225,9 @@ TEST(DurableXmlTest, DirectoriesInPlaceOfTheFilesAreNotRead) {
   ASSERT_EQ(mkdir(dir.File("notify.xml.pending").c_str(), 0755), 0);
   ASSERT_TRUE(WriteFile(dir.File("notify.xml"), "<Trellan Delta=\"0\" />"));
   TiXmlDocument document;
-  EXPECT_TRUE(LoadXmlDurably(document, dir.File("notify.xml")));
+  EXPECT_TRUE(LoadXmlDurably(*g_env, document, dir.File("notify.xml")));
   ASSERT_EQ(mkdir(dir.File("other.xml").c_str(), 0755), 0);
-  EXPECT_FALSE(LoadXmlDurably(document, dir.File("other.xml")));
+  EXPECT_FALSE(LoadXmlDurably(*g_env, document, dir.File("other.xml")));
 }
 
 // Saves of one name from two threads must not meet inside the guard: each
@@ -229,22 +247,21 @@ void CountOverlap(const std::string&) {
 TEST(DurableXmlTest, SavesOfOneNameAreSerialized) {
   TempDir dir;
   const std::string target = dir.File("notify.xml");
-  SetSideFileSyncedHook(&CountOverlap);
+  RenameWatchingEnv counting(&CountOverlap);
   std::atomic<int> failures{0};
   auto saveMany = [&](const std::string& marker) {
     TiXmlDocument document = MakeDocument(marker);
     for (int i = 0; i < 40; ++i) {
       std::string error;
-      if (!SaveXmlDurably(document, target, &error)) ++failures;
+      if (!SaveXmlDurably(counting, document, target, &error)) ++failures;
       TiXmlDocument loaded;
-      if (!LoadXmlDurably(loaded, target)) ++failures;
+      if (!LoadXmlDurably(*g_env, loaded, target)) ++failures;
     }
   };
   std::thread first(saveMany, "first");
   std::thread second(saveMany, "second");
   first.join();
   second.join();
-  SetSideFileSyncedHook(nullptr);
   EXPECT_EQ(failures.load(), 0);
   EXPECT_EQ(g_mostInsideSave.load(), 1);
   std::string text = ReadFile(target);

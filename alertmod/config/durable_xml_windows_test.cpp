@@ -5,10 +5,21 @@
 #include <stdexcept>
 
 #include "alertmod/config/durable_xml.h"
+#include "alertmod/platform/testing/manual_env.h"
 #include "tests/support/temp_dir.h"
 
 namespace hx {
 namespace {
+
+// Without fork, the process "dies" by unwinding at the rename of the side
+// file, which is complete by then; nothing of the save runs after it.
+class CrashAtRenameEnv final : public platform::EnvWrapper {
+ public:
+  CrashAtRenameEnv() : EnvWrapper(platform::SystemEnvForTests()) {}
+  platform::Status RenameFile(const std::string&, const std::string&) override {
+    throw std::runtime_error("crash");
+  }
+};
 
 TEST(DurableXmlWindowsTest, SideFileOfACrashBeforeTheRenameIsAdopted) {
   testsupport::TempDir dir;
@@ -16,15 +27,12 @@ TEST(DurableXmlWindowsTest, SideFileOfACrashBeforeTheRenameIsAdopted) {
   ASSERT_TRUE(testsupport::WriteFile(target, "<Old />\n"));
   TiXmlDocument document;
   document.LinkEndChild(new TiXmlElement("New"));
-  // Without fork, the process "dies" by unwinding from the point between the
-  // side file's sync and its rename; nothing of the save runs after it.
-  SetSideFileSyncedHook([](const std::string&) { throw std::runtime_error("crash"); });
-  EXPECT_THROW(SaveXmlDurably(document, target), std::runtime_error);
-  SetSideFileSyncedHook(nullptr);
+  CrashAtRenameEnv crashing;
+  EXPECT_THROW(SaveXmlDurably(crashing, document, target), std::runtime_error);
   ASSERT_EQ(testsupport::ReadFile(target), "<Old />\n");
 
   TiXmlDocument loaded;
-  ASSERT_TRUE(LoadXmlDurably(loaded, target));
+  ASSERT_TRUE(LoadXmlDurably(*platform::SystemEnvForTests(), loaded, target));
   EXPECT_STREQ(loaded.RootElement()->Value(), "New");
   EXPECT_EQ(testsupport::ReadFile(target), "<New />\n");
   EXPECT_FALSE(testsupport::FileExists(target + ".pending"));

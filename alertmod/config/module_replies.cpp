@@ -1,7 +1,5 @@
 #include "alertmod/config/module_replies.h"
 
-#include "alertmod/platform/clock.h"
-
 namespace hx {
 namespace {
 
@@ -80,11 +78,11 @@ ProfileStatusDocument::ProfileStatusDocument() {
 }
 
 void ReportProfileStatus(ProfileStatusDocument& document, int32_t profileId, int32_t status,
-                         core::HostCallbackFn callback) {
+                         int64_t nowSeconds, core::HostCallbackFn callback) {
   TiXmlElement& profile = document.Profile();
   profile.SetAttribute("ID", profileId);
   profile.SetAttribute("Status", status);
-  profile.SetAttribute("Time", static_cast<int32_t>(platform::WallSeconds()));
+  profile.SetAttribute("Time", static_cast<int32_t>(nowSeconds));
   PostToHost(callback, core::kClassProfileStatus, PrintCompact(document.Document()));
 }
 

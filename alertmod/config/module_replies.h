@@ -59,11 +59,11 @@ class ProfileStatusDocument {
   TiXmlElement* m_profile;  // owned by m_document
 };
 
-// Sets "ID", "Status" and "Time" (seconds since 1970, UTC, as a 32-bit
+// Sets "ID", "Status" and "Time" (`nowSeconds` since 1970, UTC, as a 32-bit
 // decimal) on the document's "Profile" element and posts the document with
 // class 4.
 void ReportProfileStatus(ProfileStatusDocument& document, int32_t profileId, int32_t status,
-                         core::HostCallbackFn callback);
+                         int64_t nowSeconds, core::HostCallbackFn callback);
 
 }  // namespace hx
 

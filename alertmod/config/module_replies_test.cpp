@@ -2,23 +2,13 @@
 
 #include <gtest/gtest.h>
 
-#include "alertmod/platform/clock.h"
 #include "tests/support/fake_host.h"
 
 namespace hx {
 namespace {
 
-int64_t g_now = 0;
-
 class ModuleRepliesTest : public ::testing::Test {
  protected:
-  void SetUp() override {
-    // Installed once: a replaced clock source is never freed.
-    static const bool installed =
-        (platform::SetWallSource([](void*) { return g_now; }, nullptr), true);
-    (void)installed;
-  }
-
   testsupport::FakeHost m_host;
 };
 
@@ -69,10 +59,8 @@ TEST_F(ModuleRepliesTest, CapabilityAttributes) {
 
 TEST_F(ModuleRepliesTest, StatusReportsReplaceTheirValues) {
   ProfileStatusDocument document;
-  g_now = 1767225600;
-  ReportProfileStatus(document, 4, kProfileStatusFailed, m_host.callback());
-  g_now += 5;
-  ReportProfileStatus(document, 7, kProfileStatusUnknown, m_host.callback());
+  ReportProfileStatus(document, 4, kProfileStatusFailed, 1767225600, m_host.callback());
+  ReportProfileStatus(document, 7, kProfileStatusUnknown, 1767225605, m_host.callback());
   auto posted = m_host.Requests().OfClass(core::kClassProfileStatus);
   ASSERT_EQ(posted.size(), 2u);
   EXPECT_EQ(posted[0].code, core::kCodeDocument);

@@ -39,8 +39,8 @@ LogImpl::~LogImpl() {
   CloseStream();
 }
 
-std::ofstream& LogImpl::Stream() {
-  if (!m_stream.is_open()) OpenStream();
+std::ostream& LogImpl::Stream() {
+  if (!m_file.is_open()) OpenStream();
   if (!m_stream.good()) {
     CloseStream();
     OpenStream();
@@ -50,16 +50,19 @@ std::ofstream& LogImpl::Stream() {
 
 void LogImpl::SetFileName(const char* name) {
   m_fileName = name ? name : "";
-  if (m_stream.is_open()) CloseStream();
+  if (m_file.is_open()) CloseStream();
 }
 
 void LogImpl::OpenStream() {
   m_stream.clear();
-  m_stream.open(m_fileName, std::ios::out | std::ios::app);
+  if (!platform::File::OpenForWriting(m_fileName, true, &m_file).ok()) {
+    m_stream.setstate(std::ios::failbit);
+  }
 }
 
 void LogImpl::CloseStream() {
-  if (m_stream.is_open()) m_stream.close();
+  // A failed close may have lost lines, so it marks the stream failed.
+  if (m_file.is_open() && !m_file.Close().ok()) m_stream.setstate(std::ios::failbit);
 }
 
 std::shared_ptr<ILgr> GetLgr() {

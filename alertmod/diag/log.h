@@ -11,12 +11,14 @@
 #define ALERTMOD_DIAG_LOG_H_
 
 #include <cstdint>
-#include <fstream>
 #include <memory>
 #include <mutex>
+#include <ostream>
 #include <string>
 
 #include "alertmod/host_records.h"
+#include "alertmod/platform/file_streambuf.h"
+#include "alertmod/platform/files.h"
 
 namespace hx {
 
@@ -40,7 +42,7 @@ class ILgr {
   virtual std::mutex& Mutex() = 0;
   // The file stream, opened in append mode on first use and reopened once
   // when it is in a failed state. Returned whatever its state.
-  virtual std::ofstream& Stream() = 0;
+  virtual std::ostream& Stream() = 0;
   // Names the file; an open file is closed and the next Stream() reopens.
   virtual void SetFileName(const char* name) = 0;
 };
@@ -51,7 +53,7 @@ class LogImpl final : public ILgr {
   ~LogImpl() override;
 
   std::mutex& Mutex() override { return m_mutex; }
-  std::ofstream& Stream() override;
+  std::ostream& Stream() override;
   void SetFileName(const char* name) override;
 
  private:
@@ -59,7 +61,9 @@ class LogImpl final : public ILgr {
   void CloseStream();
 
   std::mutex m_mutex;
-  std::ofstream m_stream;
+  platform::File m_file;
+  platform::FileStreamBuf m_buffer{&m_file};
+  std::ostream m_stream{&m_buffer};
   std::string m_fileName;
 };
 

@@ -28,6 +28,8 @@ class ProcessRegistry final {
   bool closed GUARDED_BY(lock) = false;
   uint32_t lastId GUARDED_BY(lock) = 0;
   uint32_t moduleId GUARDED_BY(lock) = 0;
+  std::chrono::milliseconds startAnswerTimeout GUARDED_BY(lock) =
+      platform::kDefaultProcessStartTimeout;
   std::atomic<SendFunction> send{nullptr};
   std::atomic<core::HostCallbackFn> logTo{nullptr};
 
@@ -39,8 +41,6 @@ class ProcessRegistry final {
 constexpr uint32_t kCounterAttempts = kIdCounterMask + 1;
 
 constexpr size_t kMaxPayloadBytes = core::kProcessMessageMaxBytes - core::kProcessHeaderBytes;
-
-std::atomic<int64_t> g_startAnswerTimeoutMs{kDefaultStartAnswerTimeout.count()};
 
 bool SendOne(SendFunction send, uint32_t id, uint32_t type, uint32_t value, const char* payload,
              size_t length, std::vector<unsigned char>& message) {
@@ -122,15 +122,16 @@ bool HasEnded(int32_t state) {
 // worker's delivery) for ever; past the time-out the run counts as not
 // started. An answer that comes in while it is given up still counts.
 void AwaitStartAnswer(const std::shared_ptr<client>& process, const std::string& program) {
-  const std::chrono::milliseconds timeout(g_startAnswerTimeoutMs.load());
-  if (process->WaitWhileIn(kStateStarting, timeout)) return;
-  if (!Abandon(process, IsAnswered)) return;
   ProcessRegistry& registry = ProcessRegistry::Instance();
   uint32_t moduleId = 0;
+  std::chrono::milliseconds timeout{0};
   {
     MutexLock lock(registry.lock);
     moduleId = registry.moduleId;
+    timeout = registry.startAnswerTimeout;
   }
+  if (process->WaitWhileIn(kStateStarting, timeout)) return;
+  if (!Abandon(process, IsAnswered)) return;
   LogToHost(moduleId, registry.logTo.load(), LogLevelError,
             "The host did not answer the start of %s within %lld ms. The program counts as not "
             "started.",
@@ -254,10 +255,16 @@ bool client::TakeResult(int32_t& exitCode, std::string* output) {
   return true;
 }
 
-void RegisterProcessService(uint32_t moduleId, SendFunction send, core::HostCallbackFn logTo) {
+void RegisterProcessService(uint32_t moduleId, SendFunction send, core::HostCallbackFn logTo,
+                            platform::Env& env) {
   ProcessRegistry& registry = ProcessRegistry::Instance();
   MutexLock lock(registry.lock);
   registry.moduleId = moduleId;
+  registry.startAnswerTimeout = std::max(env.ProcessStartTimeout(), std::chrono::milliseconds(0));
+  // The counter otherwise goes on from where the last run left it, so that
+  // ids of an earlier run that the host may still hold are not reissued at
+  // once.
+  if (uint32_t counter = env.InitialProcessIdCounter()) registry.lastId = counter;
   registry.send.store(send);
   registry.logTo.store(logTo);
   registry.closed = false;
@@ -380,16 +387,6 @@ bool RunProcess(const std::vector<std::string>& arguments, const std::string& in
   while (ReadOutputLine(*process, line, 1)) errorLines.push_back(line);
   WaitForExit(*process);
   return process->TakeResult(exitCode, output);
-}
-
-void SetStartAnswerTimeout(std::chrono::milliseconds timeout) {
-  g_startAnswerTimeoutMs.store(std::max<int64_t>(timeout.count(), 0));
-}
-
-void SetLastProcessId(uint32_t id) {
-  ProcessRegistry& registry = ProcessRegistry::Instance();
-  MutexLock lock(registry.lock);
-  registry.lastId = id;
 }
 
 }  // namespace ipc

@@ -20,6 +20,7 @@
 #include <vector>
 
 #include "alertmod/host_records.h"
+#include "alertmod/platform/env.h"
 #include "alertmod/platform/mutex.h"
 #include "alertmod/platform/thread_annotations.h"
 
@@ -96,16 +97,13 @@ class client {
   bool m_endInputAtWait GUARDED_BY(m_lock) = false;
 };
 
-// How long a start waits for the host's answer before the program counts as
-// not started.
-constexpr std::chrono::milliseconds kDefaultStartAnswerTimeout{30000};
-
 // Stores the module id and the send function and opens the service. Called by
 // Load; a new Load opens the service again after an earlier Close, since the
 // library may stay loaded in between. `logTo`, when given, receives the
-// service's own log lines.
-void RegisterProcessService(uint32_t moduleId, SendFunction send,
-                            core::HostCallbackFn logTo = nullptr);
+// service's own log lines. `env` gives the start-answer time-out and,
+// when not 0, the process-id counter to go on from.
+void RegisterProcessService(uint32_t moduleId, SendFunction send, core::HostCallbackFn logTo,
+                            platform::Env& env);
 
 // Ends every run the module still waits for: a running or starting client
 // becomes failed (its result is unknown, and must not read as exit code 0)
@@ -153,14 +151,6 @@ void WaitForExit(client& process);
 bool RunProcess(const std::vector<std::string>& arguments, const std::string& input,
                 int32_t& exitCode, std::vector<std::string>& errorLines,
                 std::string* output = nullptr);
-
-// The start-answer time-out of starts made afterwards
-// (kDefaultStartAnswerTimeout until changed). Tests shorten it.
-void SetStartAnswerTimeout(std::chrono::milliseconds timeout);
-
-// Test seam: the last id issued, so that a test can reach the counter's
-// wrap-around without a million starts.
-void SetLastProcessId(uint32_t id);
 
 }  // namespace ipc
 }  // namespace hx

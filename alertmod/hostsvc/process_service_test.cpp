@@ -11,6 +11,8 @@
 #include <string>
 #include <vector>
 
+#include "alertmod/platform/testing/manual_env.h"
+
 namespace hx {
 namespace ipc {
 namespace {
@@ -91,11 +93,15 @@ class ProcessServiceTest : public ::testing::Test {
  protected:
   void SetUp() override {
     FakeService::Instance().Reset();
-    RegisterProcessService(kModuleId, &FakeService::Send);
+    Register(&FakeService::Send);
   }
+  // Registers again (as a new Load does), with the Env's current values.
+  void Register(SendFunction send) { RegisterProcessService(kModuleId, send, nullptr, m_env); }
   void TearDown() override { ShutdownProcessService(false); }
 
   FakeService& service() { return FakeService::Instance(); }
+
+  hx::platform::ManualEnv m_env;
 
   // Starts `arguments` on another thread and answers the start with
   // `answerType`; returns the started client.
@@ -150,9 +156,11 @@ TEST_F(ProcessServiceTest, FailedStarts) {
 
   // The host takes the start and never answers: once the answer is overdue
   // the start has failed, and a late answer is dropped.
-  SetStartAnswerTimeout(std::chrono::milliseconds(50));
+  m_env.SetProcessStartTimeout(std::chrono::milliseconds(50));
+  Register(&FakeService::Send);
   std::shared_ptr<client> unanswered = StartProcess(Opts({"/bin/true"}));
-  SetStartAnswerTimeout(kDefaultStartAnswerTimeout);
+  m_env.SetProcessStartTimeout(hx::platform::kDefaultProcessStartTimeout);
+  Register(&FakeService::Send);
   EXPECT_EQ(unanswered->State(), kStateFailed);
   EXPECT_EQ(Deliver(Message(unanswered->Id(), 3, 0)), 0);
 
@@ -163,7 +171,7 @@ TEST_F(ProcessServiceTest, FailedStarts) {
   EXPECT_EQ(Deliver(Message(refused->Id(), 3, 0)), 0);
 
   // No send function.
-  RegisterProcessService(kModuleId, nullptr);
+  Register(nullptr);
   EXPECT_EQ(StartProcess(Opts({"/bin/true"}))->State(), kStateFailed);
 }
 
@@ -353,18 +361,20 @@ TEST_F(ProcessServiceTest, ShutdownReleasesWaitersAndRefusesStarts) {
   EXPECT_EQ(service().Messages().size(), sent);
 
   // A new Load opens the service again.
-  RegisterProcessService(kModuleId, &FakeService::Send);
+  Register(&FakeService::Send);
   EXPECT_EQ(Start(Opts({"p"}))->State(), kStateRunning);
 }
 
 TEST_F(ProcessServiceTest, IdsWrapAroundToTheNextFreeOne) {
-  SetLastProcessId(0xC00000 | 0xFFFFE);
+  m_env.SetInitialProcessIdCounter(0xC00000 | 0xFFFFE);
+  Register(&FakeService::Send);
   std::shared_ptr<client> last = Start(Opts({"p"}));
   EXPECT_EQ(last->Id(), 0xCFFFFFu);
   std::shared_ptr<client> wrapped = Start(Opts({"p"}));
   EXPECT_EQ(wrapped->Id(), 0xC00000u);
   // 0xC00000 still runs: the next start after another wrap skips it.
-  SetLastProcessId(0xCFFFFF);
+  m_env.SetInitialProcessIdCounter(0xCFFFFF);
+  Register(&FakeService::Send);
   EXPECT_EQ(Start(Opts({"p"}))->Id(), 0xC00001u);
 }
 

@@ -13,6 +13,7 @@
 #include "alertmod/mail/notify_file_stream.h"
 #include "alertmod/mail/notify_helper.h"
 #include "alertmod/platform/file_system.h"
+#include "alertmod/platform/testing/manual_env.h"
 #include "tests/support/fake_host.h"
 #include "tests/support/temp_dir.h"
 
@@ -23,7 +24,9 @@ constexpr int32_t kNotStarted = -1000;
 
 class ScriptedHelper final : public NotifyHelper {
  public:
-  explicit ScriptedHelper(testsupport::FakeHost& host) : NotifyHelper(host.callback()) {}
+  explicit ScriptedHelper(testsupport::FakeHost& host,
+                          platform::Env& env = *platform::SystemEnvForTests())
+      : NotifyHelper(host.callback(), env) {}
 
   void ReportStatus(int32_t profileId, int32_t status) override {
     statuses.emplace_back(profileId, status);

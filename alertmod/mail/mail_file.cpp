@@ -6,12 +6,11 @@
 #include <mutex>
 #include <regex>
 
-#include "alertmod/util/base64.h"
 #include "alertmod/diag/log.h"
 #include "alertmod/mail/notify_file.h"
-#include "alertmod/platform/clock.h"
 #include "alertmod/platform/file_system.h"
 #include "alertmod/platform/local_time.h"
+#include "alertmod/util/base64.h"
 
 namespace hx {
 namespace {
@@ -66,10 +65,10 @@ std::string MailFileName(const NotifyWorkItem& item, uint32_t part, uint32_t tot
   return name;
 }
 
-std::string DateLine() {
+std::string DateLine(int64_t dateSeconds) {
   std::tm local{};
   char text[128] = {0};
-  if (platform::LocalFields(platform::WallSeconds(), &local)) {
+  if (platform::LocalFields(dateSeconds, &local)) {
     strftime(text, sizeof(text), kDateFormat, &local);
   }
   return std::string("Date: ") + text + kCrLf;
@@ -92,14 +91,14 @@ bool AddRecipients(const char* label, const std::vector<std::string>& texts,
   return true;
 }
 
-bool WriteHeader(const NotifyWorkItem& item, uint32_t part, uint32_t total,
+bool WriteHeader(const NotifyWorkItem& item, uint32_t part, uint32_t total, int64_t dateSeconds,
                  INotifyFileStream& stream, MailFile& mail) {
   std::string sender = item.profile.from;
   if (!ExtractAddress(sender)) return false;
   mail.sender = sender;
   stream.WriteText("From: ").WriteString(sender).WriteText(kCrLf);
   if (!AddRecipients("To: ", item.profile.to, stream, mail)) return false;
-  stream.WriteString(DateLine());
+  stream.WriteString(DateLine(dateSeconds));
   if (!AddRecipients("Cc: ", item.profile.cc, stream, mail)) return false;
   // Blind copies travel in the envelope only: a header line would show their
   // addresses to every other recipient.
@@ -211,13 +210,13 @@ std::string RefreshDataDirectory() {
 }  // namespace
 
 bool ComposeMailFile(const NotifyWorkItem& item, const std::vector<MailAttachment>& attachments,
-                     uint32_t part, uint32_t total, uint32_t sequence, INotifyFileStream& stream,
-                     MailFile& mail) {
+                     uint32_t part, uint32_t total, uint32_t sequence, int64_t dateSeconds,
+                     INotifyFileStream& stream, MailFile& mail) {
   mail.path = MailFileName(item, part, total, sequence);
   mail.sender.clear();
   mail.recipients.clear();
   if (!stream.Open(mail.path, std::ios_base::binary | std::ios_base::trunc)) return false;
-  bool addressed = WriteHeader(item, part, total, stream, mail);
+  bool addressed = WriteHeader(item, part, total, dateSeconds, stream, mail);
   if (addressed && attachments.empty()) {
     stream.WriteText(kCrLf).WriteString(CrLfLines(item.profile.body));
   } else if (addressed) {

@@ -60,14 +60,14 @@ struct PreparedAttachment {
 // which carries every included file in base64. Every line ends with CR LF:
 // a bare LF of the body becomes CR LF, a CR LF there stays as it is. `part`
 // is 1-based, or 0 when the notification is not split; `total` is the number
-// of parts.
+// of parts. The Date line shows `dateSeconds` (since 1970) in local time.
 // Returns false when the file cannot be created, when the From text or any
 // To, Cc or Bcc text holds no address (the partly written file stays), or
 // when any write, including the final flush, failed. The stream is closed
 // before returning whenever it was opened.
 bool ComposeMailFile(const NotifyWorkItem& item, const std::vector<MailAttachment>& attachments,
-                     uint32_t part, uint32_t total, uint32_t sequence, INotifyFileStream& stream,
-                     MailFile& mail);
+                     uint32_t part, uint32_t total, uint32_t sequence, int64_t dateSeconds,
+                     INotifyFileStream& stream, MailFile& mail);
 
 // Replaces `text` by the first e-mail address found in it ("Front Desk
 // <desk@example.com>" gives "desk@example.com") and returns true; returns

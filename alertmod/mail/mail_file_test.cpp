@@ -11,7 +11,7 @@
 #include <ctime>
 #include <memory>
 
-#include "alertmod/platform/clock.h"
+#include "alertmod/platform/testing/manual_env.h"
 #include "tests/support/fake_host.h"
 #include "tests/support/temp_dir.h"
 
@@ -26,20 +26,8 @@ constexpr char kPython[] = "/usr/bin/python3";
 constexpr char kBoundaryLine[] = "--b1914efc629febb89915e8a6f83ba6eb";
 constexpr char kMessagePath[] = "./data/notify-mail-3-1700000000-250-7";
 
-// Composition time while a test runs: 2024-01-02 09:00:00 UTC. The source is
-// installed once per process and never replaced, since a replaced clock
-// source is never freed.
-bool g_fixedCompositionTime = false;
-
-int64_t CompositionTime(void*) {
-  return g_fixedCompositionTime ? 1704186000 : static_cast<int64_t>(time(nullptr));
-}
-
-void FixCompositionTime(bool fixed) {
-  static const bool installed = (platform::SetWallSource(&CompositionTime, nullptr), true);
-  (void)installed;
-  g_fixedCompositionTime = fixed;
-}
+// The composition time of every message: 2024-01-02 09:00:00 UTC.
+constexpr int64_t kCompositionTime = 1704186000;
 
 // Deterministic bytes that exercise every byte value.
 std::string Bytes(size_t count, uint32_t seed) {
@@ -86,12 +74,9 @@ class MailFileTest : public ::testing::Test {
     setenv("TZ", "CET-1CEST,M3.5.0,M10.5.0/3", 1);
     tzset();
     setlocale(LC_ALL, "C");
-    FixCompositionTime(true);
     m_chdir = std::make_unique<testsupport::ScopedChdir>(m_dir.path());
     ASSERT_EQ(mkdir("data", 0777), 0);
   }
-
-  void TearDown() override { FixCompositionTime(false); }
 
   static NotifyWorkItem Item() {
     NotifyWorkItem item(kWorkItemNotification);
@@ -111,9 +96,10 @@ class MailFileTest : public ::testing::Test {
   // Composes `item` as sequence 7 and returns the file's content.
   std::string Compose(const NotifyWorkItem& item, const std::vector<MailAttachment>& attachments,
                       uint32_t part = 0, uint32_t total = 1) {
-    NotifyFileStreamImpl stream(m_host.callback());
+    NotifyFileStreamImpl stream(m_host.callback(), *platform::SystemEnvForTests());
     m_mail = MailFile();
-    EXPECT_TRUE(ComposeMailFile(item, attachments, part, total, 7, stream, m_mail));
+    EXPECT_TRUE(
+        ComposeMailFile(item, attachments, part, total, 7, kCompositionTime, stream, m_mail));
     std::string content = ReadFile(m_mail.path);
     EXPECT_EQ(m_mail.size, content.size());
     return content;
@@ -342,18 +328,18 @@ TEST_F(MailFileTest, CompositionFailures) {
     item.profile.to = c.to;
     item.profile.cc.clear();
     item.profile.bcc = c.bcc;
-    NotifyFileStreamImpl stream(m_host.callback());
+    NotifyFileStreamImpl stream(m_host.callback(), *platform::SystemEnvForTests());
     MailFile mail;
-    EXPECT_FALSE(ComposeMailFile(item, {}, 0, 1, 7, stream, mail)) << c.name;
+    EXPECT_FALSE(ComposeMailFile(item, {}, 0, 1, 7, kCompositionTime, stream, mail)) << c.name;
     EXPECT_EQ(ReadFile(kMessagePath), c.written) << c.name;
   }
 }
 
 TEST_F(MailFileTest, MissingDataDirectoryFailsTheOpen) {
   ASSERT_EQ(rmdir("data"), 0);
-  NotifyFileStreamImpl stream(m_host.callback());
+  NotifyFileStreamImpl stream(m_host.callback(), *platform::SystemEnvForTests());
   MailFile mail;
-  EXPECT_FALSE(ComposeMailFile(Item(), {}, 0, 1, 7, stream, mail));
+  EXPECT_FALSE(ComposeMailFile(Item(), {}, 0, 1, 7, kCompositionTime, stream, mail));
   EXPECT_EQ(mail.path, kMessagePath);
 }
 
@@ -365,9 +351,10 @@ TEST_F(MailFileTest, FullVolumeFailsTheMessage) {
     std::vector<MailAttachment> attachments;
     if (attachmentBytes > 0)
       attachments.push_back(Attachment("big.jpg", Bytes(attachmentBytes, 3)));
-    NotifyFileStreamImpl stream(m_host.callback());
+    NotifyFileStreamImpl stream(m_host.callback(), *platform::SystemEnvForTests());
     MailFile mail;
-    EXPECT_FALSE(ComposeMailFile(Item(), attachments, 0, 1, 7, stream, mail)) << attachmentBytes;
+    EXPECT_FALSE(ComposeMailFile(Item(), attachments, 0, 1, 7, kCompositionTime, stream, mail))
+        << attachmentBytes;
     ASSERT_EQ(unlink(kMessagePath), 0);
   }
 }

@@ -116,7 +116,8 @@ bool SendMessage(NotifyWorkItem& item, const std::vector<MailAttachment>& attach
                  int32_t maxRetryQueue) {
   MailFile mail;
   RetryQueue& retries = helper.Retries();
-  if (!ComposeMailFile(item, attachments, part, total, retries.Sequence(), stream, mail)) {
+  if (!ComposeMailFile(item, attachments, part, total, retries.Sequence(),
+                       helper.GetEnv().WallSeconds(), stream, mail)) {
     // A message that could not be written whole (a full volume) is never
     // sent; its file would only take space until the next start.
     stream.RemoveFile(mail.path);
@@ -144,7 +145,9 @@ bool SendMessage(NotifyWorkItem& item, const std::vector<MailAttachment>& attach
 
 void RunNotificationJob(NotifyWorkItem& item, NotifyHelper& helper, INotifyFileStream& stream,
                         int32_t maxRetryQueue, IAttachmentWriter& writer) {
-  if (item.profile.hasPlaceholders) ExpandTemplates(item, helper.Callback());
+  if (item.profile.hasPlaceholders) {
+    ExpandTemplates(item, helper.Callback(), helper.GetEnv().WebExchangeTimeout());
+  }
   const std::string directory = DataDirectory();
   if (!stream.CreateDirectory(directory)) {
     LogToHost(core::kModuleId, helper.Callback(), LogLevelError,

@@ -35,8 +35,10 @@ class IAttachmentWriter {
   virtual bool WriteJpeg(const CVideoEmailStream& stream, const std::string& path) = 0;
 };
 
-// The module's attachment writer, logging through `callback`.
-std::unique_ptr<IAttachmentWriter> MakeAttachmentWriter(core::HostCallbackFn callback);
+// The module's attachment writer, logging through `callback` and writing
+// files through `env`, which must outlive it.
+std::unique_ptr<IAttachmentWriter> MakeAttachmentWriter(core::HostCallbackFn callback,
+                                                        platform::Env& env);
 
 // Runs the whole job for `item`. Failures are logged and reported to the host
 // as status 1; nothing is thrown for expected failures. A message file that

@@ -66,7 +66,8 @@ std::shared_ptr<CVideoEmailStream> Clip(uint32_t codec, std::vector<uint32_t> ar
 
 class NotificationJobTest : public ::testing::Test {
  protected:
-  NotificationJobTest() : m_chdir(m_dir.path()), m_helper(m_host), m_stream(m_host.callback()) {
+  NotificationJobTest()
+      : m_chdir(m_dir.path()), m_helper(m_host), m_stream(m_host.callback(), m_env) {
     m_item.profile.id = 3;
     m_item.profile.description = "Lobby";
     m_item.profile.from = "alarm@example.com";
@@ -96,6 +97,7 @@ class NotificationJobTest : public ::testing::Test {
   testsupport::TempDir m_dir;
   testsupport::ScopedChdir m_chdir;
   testsupport::FakeHost m_host;
+  platform::ManualEnv m_env;
   ScriptedHelper m_helper;
   NotifyFileStreamImpl m_stream;
   RecordingWriter m_writer;
@@ -168,7 +170,8 @@ TEST_F(NotificationJobTest, MissingCodecLibrariesLeaveTheClipOut) {
   av_init::Instance().SetLibraryDirectory(m_dir.File("no-codecs"));
   av_init::Instance().Reload();
   AddSource("Lobby", Clip(5, {0, 40}, 100, 0));
-  RunNotificationJob(m_item, m_helper, m_stream, 100, *MakeAttachmentWriter(m_host.callback()));
+  RunNotificationJob(m_item, m_helper, m_stream, 100,
+                     *MakeAttachmentWriter(m_host.callback(), m_env));
   av_init::Instance().SetLibraryDirectory("");
   ASSERT_EQ(m_helper.messages.size(), 1u);
   EXPECT_NE(m_helper.messages[0].find("- Failed to prepare video attachment for source: "

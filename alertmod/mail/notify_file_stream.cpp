@@ -16,7 +16,8 @@ constexpr size_t kCopyChunkBytes = 4096;
 
 }  // namespace
 
-NotifyFileStreamImpl::NotifyFileStreamImpl(core::HostCallbackFn callback) : m_callback(callback) {}
+NotifyFileStreamImpl::NotifyFileStreamImpl(core::HostCallbackFn callback, platform::Env& env)
+    : m_callback(callback), m_env(env) {}
 
 NotifyFileStreamImpl::~NotifyFileStreamImpl() {
   if (m_file.is_open()) Close();
@@ -27,7 +28,7 @@ bool NotifyFileStreamImpl::Open(const std::string& path, std::ios_base::openmode
   m_buffer.clear();
   m_flushedBytes = 0;
   const bool append = (mode & std::ios_base::app) != 0;
-  m_failed = !platform::File::OpenForWriting(path, append, &m_file).ok();
+  m_failed = !m_env.NewWritableFile(path, append, &m_file).ok();
   return !m_failed;
 }
 
@@ -95,7 +96,7 @@ uint64_t NotifyFileStreamImpl::Position() {
 
 uint64_t NotifyFileStreamImpl::FreeBytes(const std::string& directory) {
   uint64_t bytes = 0;
-  platform::Status status = platform::QueryFreeBytes(directory, &bytes);
+  platform::Status status = m_env.FreeBytes(directory, &bytes);
   if (!status.ok()) {
     LogToHost(core::kModuleId, m_callback, LogLevelInfo, "Exception while query volume space: %s",
               status.message().c_str());
@@ -109,7 +110,7 @@ bool NotifyFileStreamImpl::CreateDirectory(const std::string& directory) {
 }
 
 bool NotifyFileStreamImpl::RemoveFile(const std::string& path) {
-  return platform::DeleteFile(path).ok();
+  return m_env.RemoveFile(path).ok();
 }
 
 }  // namespace hx

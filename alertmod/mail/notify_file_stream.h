@@ -4,7 +4,7 @@
 //
 // The worker creates one stream per job or retry pass and is its only user;
 // a stream is never shared between threads. Tests substitute the interface, or
-// only the free-space query (platform::SetFreeBytesQuery).
+// only the free-space query (through the Env the stream is given).
 #ifndef ALERTMOD_MAIL_NOTIFY_FILE_STREAM_H_
 #define ALERTMOD_MAIL_NOTIFY_FILE_STREAM_H_
 
@@ -14,6 +14,7 @@
 #include <string>
 
 #include "alertmod/host_records.h"
+#include "alertmod/platform/env.h"
 #include "alertmod/platform/files.h"
 
 namespace hx {
@@ -65,9 +66,11 @@ class INotifyFileStream {
 // of its own, so that the many short writes of a message cost few system
 // calls. A failed write of the buffer puts the stream in its error state.
 // Log lines (a failed free-space query) go to the host through `callback`.
+// Files are opened, removed and measured through `env`, which must outlive
+// the stream.
 class NotifyFileStreamImpl final : public INotifyFileStream {
  public:
-  explicit NotifyFileStreamImpl(core::HostCallbackFn callback);
+  NotifyFileStreamImpl(core::HostCallbackFn callback, platform::Env& env);
   ~NotifyFileStreamImpl() override;
   NotifyFileStreamImpl(const NotifyFileStreamImpl&) = delete;
   NotifyFileStreamImpl& operator=(const NotifyFileStreamImpl&) = delete;
@@ -92,6 +95,7 @@ class NotifyFileStreamImpl final : public INotifyFileStream {
   void Flush();
 
   core::HostCallbackFn m_callback;
+  platform::Env& m_env;
   platform::File m_file;
   std::string m_buffer;
   uint64_t m_flushedBytes = 0;

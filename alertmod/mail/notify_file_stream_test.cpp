@@ -6,6 +6,7 @@
 #include <sstream>
 
 #include "alertmod/platform/file_system.h"
+#include "alertmod/platform/testing/manual_env.h"
 #include "tests/support/fake_host.h"
 #include "tests/support/temp_dir.h"
 
@@ -16,46 +17,36 @@ using testsupport::FileExists;
 using testsupport::ReadFile;
 using testsupport::WriteFile;
 
-struct FreeSpace {
-  bool ok;
-  uint64_t bytes;
-};
-
-platform::Status ReplacedQuery(void* context, const std::string&, uint64_t* bytes) {
-  const FreeSpace* space = static_cast<const FreeSpace*>(context);
-  if (!space->ok) return platform::Status::Failure("volume gone");
-  *bytes = space->bytes;
-  return platform::Status::OK();
-}
-
 class NotifyFileStreamTest : public ::testing::Test {
  protected:
-  void TearDown() override { platform::SetFreeBytesQuery(nullptr, nullptr); }
-
   testsupport::TempDir m_dir;
   testsupport::FakeHost m_host;
-  NotifyFileStreamImpl m_stream{m_host.callback()};
+  platform::ManualEnv m_env;
+  NotifyFileStreamImpl m_stream{m_host.callback(), m_env};
 };
 
 TEST_F(NotifyFileStreamTest, FreeBytes) {
   struct Case {
-    FreeSpace space;
+    bool ok;
+    uint64_t bytes;
     uint64_t expected;
     bool logged;
   };
   const Case cases[] = {
-      {{true, 5}, 5, false},
-      {{true, 0}, 0, false},
-      {{true, UINT64_MAX}, kUnknownFreeBytes, false},  // the volume knows no size
-      {{false, 0}, kUnknownFreeBytes, true},
+      {true, 5, 5, false},
+      {true, 0, 0, false},
+      {true, UINT64_MAX, kUnknownFreeBytes, false},  // the volume knows no size
+      {false, 0, kUnknownFreeBytes, true},
   };
   for (const Case& c : cases) {
-    platform::SetFreeBytesQuery(&ReplacedQuery, const_cast<FreeSpace*>(&c.space));
+    m_env.SetFreeBytes(c.bytes);
+    m_env.FailFreeBytesQueries(!c.ok);
     size_t linesBefore = m_host.LogTexts().size();
     EXPECT_EQ(m_stream.FreeBytes(m_dir.path()), c.expected);
     EXPECT_EQ(m_host.LogTexts().size(), linesBefore + (c.logged ? 1 : 0));
   }
-  EXPECT_EQ(m_host.LogTexts(25).back(), "Exception while query volume space: volume gone");
+  EXPECT_EQ(m_host.LogTexts(25).back(),
+            "Exception while query volume space: the test's volume cannot be queried");
 }
 
 TEST_F(NotifyFileStreamTest, FreeBytesOfTheRealVolume) {

@@ -5,12 +5,13 @@
 
 namespace hx {
 
-NotifyHelper::NotifyHelper(core::HostCallbackFn callback) : m_callback(callback) {}
+NotifyHelper::NotifyHelper(core::HostCallbackFn callback, platform::Env& env)
+    : m_callback(callback), m_env(env), m_retries(env) {}
 
 NotifyHelper::~NotifyHelper() = default;
 
 void NotifyHelper::ReportStatus(int32_t profileId, int32_t status) {
-  ReportProfileStatus(m_statusDocument, profileId, status, m_callback);
+  ReportProfileStatus(m_statusDocument, profileId, status, m_env.WallSeconds(), m_callback);
 }
 
 DeliveryResult NotifyHelper::Deliver(const MailFile& mail, const std::vector<SmtpServer>& servers) {

@@ -15,12 +15,15 @@
 #include "alertmod/config/module_replies.h"
 #include "alertmod/host_records.h"
 #include "alertmod/mail/retry_queue.h"
+#include "alertmod/platform/env.h"
 
 namespace hx {
 
 class NotifyHelper : public RetryDelivery {
  public:
-  explicit NotifyHelper(core::HostCallbackFn callback);
+  // `env` gives the clocks of the retry queue and the status reports; it
+  // must outlive the helper.
+  NotifyHelper(core::HostCallbackFn callback, platform::Env& env);
   ~NotifyHelper() override;
 
   NotifyHelper(const NotifyHelper&) = delete;
@@ -40,9 +43,11 @@ class NotifyHelper : public RetryDelivery {
 
   core::HostCallbackFn Callback() const override { return m_callback; }
   RetryQueue& Retries() { return m_retries; }
+  platform::Env& GetEnv() const { return m_env; }
 
  private:
   core::HostCallbackFn m_callback;
+  platform::Env& m_env;
   ProfileStatusDocument m_statusDocument;
   RetryQueue m_retries;
 };

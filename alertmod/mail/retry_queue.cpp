@@ -3,7 +3,6 @@
 #include <cinttypes>
 
 #include "alertmod/diag/log.h"
-#include "alertmod/platform/clock.h"
 
 namespace hx {
 namespace {
@@ -17,7 +16,7 @@ bool Before(uint32_t a, uint32_t b) {
 }  // namespace
 
 uint64_t RetryQueue::Now() {
-  uint32_t tick = platform::TickMs();
+  uint32_t tick = m_env.TickMs();
   if (m_clockStarted) m_widenedMs += static_cast<uint32_t>(tick - m_lastTick);
   m_clockStarted = true;
   m_lastTick = tick;

@@ -21,6 +21,7 @@
 #include "alertmod/mail/mail_file.h"
 #include "alertmod/mail/notify_file_stream.h"
 #include "alertmod/mail/smtp_delivery.h"
+#include "alertmod/platform/env.h"
 
 namespace hx {
 
@@ -51,6 +52,11 @@ constexpr uint32_t kLongestBackoffMs = 1u << 30;
 
 class RetryQueue {
  public:
+  // The queue reads its tick from `env`, which must outlive it.
+  explicit RetryQueue(platform::Env& env) : m_env(env) {}
+  RetryQueue(const RetryQueue&) = delete;
+  RetryQueue& operator=(const RetryQueue&) = delete;
+
   bool Empty() const { return m_queue.empty(); }
   size_t Size() const { return m_queue.size(); }
 
@@ -91,6 +97,7 @@ class RetryQueue {
   bool MakeRoom(RetryDelivery& delivery, INotifyFileStream& stream);
   void Remove(std::deque<Entry>::iterator entry, INotifyFileStream& stream);
 
+  platform::Env& m_env;
   uint32_t m_sequence = 0;
   uint32_t m_backoff = 0;
   uint32_t m_nextRetry = 0;

@@ -4,7 +4,7 @@
 
 #include "alertmod/diag/log.h"
 #include "alertmod/mail/delivery_test_util.h"
-#include "alertmod/platform/clock.h"
+#include "alertmod/platform/testing/manual_env.h"
 #include "tests/support/temp_dir.h"
 
 namespace hx {
@@ -13,12 +13,20 @@ namespace {
 constexpr uint64_t kMiB = 1048576;
 constexpr int32_t kTwoDays = 172800;
 
+// An Env whose tick is the test's variable.
+class VariableTickEnv final : public platform::EnvWrapper {
+ public:
+  explicit VariableTickEnv(const uint32_t* tick)
+      : EnvWrapper(platform::SystemEnvForTests()), m_tick(tick) {}
+  uint32_t TickMs() override { return *m_tick; }
+
+ private:
+  const uint32_t* const m_tick;
+};
+
 class RetryQueueTest : public ::testing::Test {
  protected:
-  RetryQueueTest() : m_chdir(m_dir.path()), m_helper(m_host) {
-    platform::SetTickSource([](void* c) { return *static_cast<uint32_t*>(c); }, &m_tick);
-  }
-  ~RetryQueueTest() override { platform::SetTickSource(nullptr, nullptr); }
+  RetryQueueTest() : m_chdir(m_dir.path()), m_helper(m_host) {}
 
   // A message file on disk of `size` bytes, as a failed delivery leaves it.
   MailFile Message(const std::string& name, uint64_t size = 100, uint32_t profileId = 3) {
@@ -39,13 +47,14 @@ class RetryQueueTest : public ::testing::Test {
   void AdvanceSeconds(uint64_t seconds) { m_tick += static_cast<uint32_t>(seconds * 1000); }
   bool LogHas(const std::string& text) { return m_host.Log().Contains(text); }
 
+  uint32_t m_tick = 5000;
+  VariableTickEnv m_env{&m_tick};
   testsupport::TempDir m_dir;
   testsupport::ScopedChdir m_chdir;
   testsupport::FakeHost m_host;
   ScriptedHelper m_helper;
   FakeStream m_stream;
-  RetryQueue m_queue;
-  uint32_t m_tick = 5000;
+  RetryQueue m_queue{m_env};
 };
 
 TEST_F(RetryQueueTest, QueueLimitDropsTheOldestOnly) {
@@ -68,7 +77,7 @@ TEST_F(RetryQueueTest, LowFreeSpacePurgesLargeOldMessages) {
     bool queued;
   };
   for (Case c : {Case{100 * kMiB, true}, Case{99 * kMiB, false}}) {
-    RetryQueue queue;
+    RetryQueue queue(m_env);
     FakeStream stream;
     MailFile small = Message("small", 2048), six = Message("six", 6 * kMiB),
              eight = Message("eight", 8 * kMiB), fresh = Message("new", 5 * kMiB);
@@ -190,7 +199,7 @@ TEST_F(RetryQueueTest, RetryWindowEndsTheRetries) {
       {0, 60, 60},
   };
   for (const Case& c : cases) {
-    RetryQueue queue;
+    RetryQueue queue(m_env);
     queue.Enqueue(m_helper, Message("w" + std::to_string(c.maxRetrySeconds)), {SmtpServer{}}, 100,
                   m_stream);
     uint64_t seconds = SecondsUntilDiscarded(queue, m_helper, m_stream, m_tick, c.maxRetrySeconds);

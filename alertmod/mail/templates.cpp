@@ -61,7 +61,8 @@ void ReplaceFirstInBodyAndSubject(NotifyWorkItem& item, const char* placeholder,
   ReplaceFirst(item.profile.subject, placeholder, value);
 }
 
-void ExpandWebLink(NotifyWorkItem& item, core::HostCallbackFn callback) {
+void ExpandWebLink(NotifyWorkItem& item, core::HostCallbackFn callback,
+                   std::chrono::milliseconds webTimeout) {
   std::string& body = item.profile.body;
   if (body.find(kWebLink) == std::string::npos) return;
   std::string link;
@@ -73,7 +74,7 @@ void ExpandWebLink(NotifyWorkItem& item, core::HostCallbackFn callback) {
              !item.videoSources.empty()) {
     std::vector<uint32_t> cameraKeys;
     for (const VideoSource& source : item.videoSources) cameraKeys.push_back(source.sourceKey);
-    link = MakeWebLink(item.web, item.serial, item.eventTime, cameraKeys, callback);
+    link = MakeWebLink(item.web, item.serial, item.eventTime, cameraKeys, callback, webTimeout);
   } else {
     link = kNotVideoEventText;
   }
@@ -141,8 +142,9 @@ bool HasPlaceholders(const std::string& text) {
   return ContainsAny(text, std::begin(kPlaceholders), std::end(kPlaceholders));
 }
 
-void ExpandTemplates(NotifyWorkItem& item, core::HostCallbackFn callback) {
-  ExpandWebLink(item, callback);
+void ExpandTemplates(NotifyWorkItem& item, core::HostCallbackFn callback,
+                     std::chrono::milliseconds webTimeout) {
+  ExpandWebLink(item, callback, webTimeout);
   if (std::optional<std::string> eventType = EventTypeValue(item.eventType)) {
     ReplaceFirstInBodyAndSubject(item, kEventType, *eventType);
   }

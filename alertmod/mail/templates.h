@@ -8,6 +8,7 @@
 #ifndef ALERTMOD_MAIL_TEMPLATES_H_
 #define ALERTMOD_MAIL_TEMPLATES_H_
 
+#include <chrono>
 #include <cstdint>
 #include <string>
 
@@ -26,10 +27,12 @@ bool HasPlaceholders(const std::string& text);
 // then the date/time pass runs on the subject and on the body. "{weblink}" is
 // replaced in the body only and may block for one request to the web server.
 // The warning for a missing web server goes to the host through `callback`,
-// which also serves the web link's own log lines. Call it once per item, and
+// which also serves the web link's own log lines; `webTimeout` bounds the
+// exchange with the web server. Call it once per item, and
 // only when the item's placeholder flag is set. Never fails: a value that
 // cannot be had becomes a bracketed text.
-void ExpandTemplates(NotifyWorkItem& item, core::HostCallbackFn callback);
+void ExpandTemplates(NotifyWorkItem& item, core::HostCallbackFn callback,
+                     std::chrono::milliseconds webTimeout);
 
 // The date/time pass. When `text` contains "{date}", "{time}" or
 // "{date format", it is rebuilt: every brace group that reads as an XML

@@ -150,21 +150,21 @@ TEST_F(TemplatesTest, ReplacesFirstOccurrenceOnly) {
   };
   for (const Case& c : cases) {
     NotifyWorkItem item = Item(2, "", c.body);
-    ExpandTemplates(item, m_host.callback());
+    ExpandTemplates(item, m_host.callback(), std::chrono::seconds(10));
     EXPECT_EQ(item.profile.body, c.expected) << c.body;
   }
   // An inserted value is plain text for the later steps.
   NotifyWorkItem item = Item(2, "{serial}", "x");
   item.sourceName = "{serial}";
   item.profile.body = "{source}";
-  ExpandTemplates(item, m_host.callback());
+  ExpandTemplates(item, m_host.callback(), std::chrono::seconds(10));
   EXPECT_EQ(item.profile.body, "SN-42");
   EXPECT_EQ(item.profile.subject, "SN-42");
 }
 
 TEST_F(TemplatesTest, SubjectWithSourceAndTime) {
   NotifyWorkItem item = Item(2, "Motion on {source} at {time}", "");
-  ExpandTemplates(item, m_host.callback());
+  ExpandTemplates(item, m_host.callback(), std::chrono::seconds(10));
   EXPECT_EQ(item.profile.subject, std::string("Motion on Lobby at ") + kTime);
 }
 
@@ -184,7 +184,7 @@ TEST_F(TemplatesTest, EventTypeAndSourceByCode) {
   };
   for (const Case& c : cases) {
     NotifyWorkItem item = Item(c.eventType, "{event type}|{source}", "{source}|{event type}");
-    ExpandTemplates(item, m_host.callback());
+    ExpandTemplates(item, m_host.callback(), std::chrono::seconds(10));
     EXPECT_EQ(item.profile.subject, c.eventTypeText + "|" + c.sourceText) << c.eventType;
     EXPECT_EQ(item.profile.body, c.sourceText + "|" + c.eventTypeText) << c.eventType;
   }
@@ -194,7 +194,7 @@ TEST_F(TemplatesTest, TestNotification) {
   NotifyWorkItem item = Item(kTestEventType, "{event type} from {source}", "");
   item.sourceName = "[Test Event Source]";
   item.sourceKey = kTestSourceKey;
-  ExpandTemplates(item, m_host.callback());
+  ExpandTemplates(item, m_host.callback(), std::chrono::seconds(10));
   EXPECT_EQ(item.profile.subject, "[Test Event Type] from [Test Event Source]");
 }
 
@@ -231,7 +231,7 @@ TEST_F(TemplatesTest, WebLinkChoices) {
     item.web.port = port;
     item.web.address = "127.0.0.1:" + port;
     if (c.withVideo) item.videoSources.push_back(VideoSource{7, "Cam", nullptr});
-    ExpandTemplates(item, m_host.callback());
+    ExpandTemplates(item, m_host.callback(), std::chrono::seconds(10));
     std::string expected = c.expected.empty() ? "[Web Server Unreachable]" : c.expected;
     EXPECT_EQ(item.profile.body, "see " + expected + " and {weblink}") << c.name;
     EXPECT_EQ(item.profile.subject, "{weblink}") << c.name;
@@ -243,14 +243,14 @@ TEST_F(TemplatesTest, WebLinkChoices) {
 
 TEST_F(TemplatesTest, WebLinkInSubjectIsRemovedByDatePass) {
   NotifyWorkItem item = Item(2, "{weblink} {date}", "");
-  ExpandTemplates(item, m_host.callback());
+  ExpandTemplates(item, m_host.callback(), std::chrono::seconds(10));
   EXPECT_EQ(item.profile.subject, std::string(" ") + kDate);
   EXPECT_TRUE(m_host.LogTexts().empty());
 }
 
 TEST_F(TemplatesTest, TextWithoutPlaceholdersIsUntouched) {
   NotifyWorkItem item = Item(2, "Plain {x} subject", "Body {y} {Date}");
-  ExpandTemplates(item, m_host.callback());
+  ExpandTemplates(item, m_host.callback(), std::chrono::seconds(10));
   EXPECT_EQ(item.profile.subject, "Plain {x} subject");
   EXPECT_EQ(item.profile.body, "Body {y} {Date}");
 }

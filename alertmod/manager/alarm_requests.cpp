@@ -17,7 +17,6 @@
 #include "alertmod/manager/event_source.h"
 #include "alertmod/manager/notify_manager.h"
 #include "alertmod/manager/video_capture.h"
-#include "alertmod/platform/clock.h"
 
 namespace hx {
 namespace {
@@ -164,7 +163,7 @@ void NotifyManager::HandleAlarmRequest(const TiXmlElement& request) {
   const char* message = request.Attribute("Message");
   const bool test = message != nullptr && std::strcmp(message, kTestMessage) == 0;
   if (!test && !EdgeNotifies(profile->eventEdge, alarmStarts)) return;
-  if (!m_throttle.Admit(profileId, profile->throttleSeconds, platform::TickMs())) return;
+  if (!m_throttle.Admit(profileId, profile->throttleSeconds, m_env.TickMs())) return;
   std::shared_ptr<NotifyWorkItem> item =
       BuildWorkItem({*profile, request, alarmStarts, *action}, m_config, m_server, m_callback);
   if (test) {
@@ -182,7 +181,7 @@ void NotifyManager::RaiseNotification(const std::shared_ptr<NotifyWorkItem>& ite
   const int32_t wait =
       static_cast<int32_t>(static_cast<uint32_t>(profile.maxVideoSeconds) + kDeadlineGraceSeconds);
   auto callback =
-      std::make_shared<SNOTIFY_CALLBACK>(this, item, platform::WallSeconds() + int64_t{wait});
+      std::make_shared<SNOTIFY_CALLBACK>(this, item, m_env.WallSeconds() + int64_t{wait});
   // Parked before any capture is attached: a capture that is complete the
   // moment it is attached reports at once, and its report must find the
   // notification waiting so that it becomes ready like any later one.
@@ -206,7 +205,7 @@ void NotifyManager::ReleasePendingOfSource(uint32_t key, bool alarmStarts) {
 }
 
 CaptureContext NotifyManager::MakeCaptureContext() {
-  return CaptureContext{m_catalogue, m_videoBuffer, m_wanted, m_aliases, m_callback};
+  return CaptureContext{m_catalogue, m_videoBuffer, m_wanted, m_aliases, m_callback, m_env};
 }
 
 }  // namespace hx

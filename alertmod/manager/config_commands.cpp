@@ -13,7 +13,7 @@
 #include "alertmod/mail/smtp_probe.h"
 #include "alertmod/mail/templates.h"
 #include "alertmod/manager/notify_manager.h"
-#include "alertmod/platform/files.h"
+#include "alertmod/platform/env.h"
 
 namespace hx {
 namespace {
@@ -57,8 +57,8 @@ std::vector<int32_t> ProfilesToReset(const NotifyCfg& before, const NotifyCfg& a
   return ids;
 }
 
-void KeepRejectedFile(core::HostCallbackFn callback) {
-  platform::Status status = platform::RenameReplacing(kConfigFileName, kRejectedConfigFileName);
+void KeepRejectedFile(platform::Env& env, core::HostCallbackFn callback) {
+  platform::Status status = env.RenameFile(kConfigFileName, kRejectedConfigFileName);
   if (status.IsNotFound()) return;
   if (status.ok()) {
     LogToHost(core::kModuleId, callback, LogLevelWarning,
@@ -97,8 +97,8 @@ void NotifyManager::LoadConfig() {
   ProbeSmtps(m_config);
   PostModuleDescription(m_callback);
   TiXmlDocument document;
-  const bool loaded =
-      LoadXmlDurably(document, kConfigFileName) && m_config.Parse(document, m_configServices);
+  const bool loaded = LoadXmlDurably(m_env, document, kConfigFileName) &&
+                      m_config.Parse(document, m_configServices);
   // A file rejected for a missing "Servers" or "Profiles" still sets the
   // three limits it carries; the worker and the video buffer follow them.
   SetVideoBufferLimit(m_config.EmailSizeLimitBytes());
@@ -113,7 +113,7 @@ void NotifyManager::LoadConfig() {
             "empty configuration.");
   // PostConfig is about to write the defaults; a file the user may still
   // want must not be lost under them.
-  KeepRejectedFile(m_callback);
+  KeepRejectedFile(m_env, m_callback);
 }
 
 void NotifyManager::PostConfig() {
@@ -122,7 +122,7 @@ void NotifyManager::PostConfig() {
   // is (the error sink has said so): it may hold that password.
   const bool complete = BuildConfigDocument(document, m_config, m_configServices);
   std::string error;
-  if (complete && SaveXmlDurably(document, kConfigFileName, &error)) {
+  if (complete && SaveXmlDurably(m_env, document, kConfigFileName, &error)) {
     m_config.RememberStoredPasswords(document);
   } else if (complete) {
     LogToHost(core::kModuleId, m_callback, LogLevelError,
@@ -147,7 +147,7 @@ bool NotifyManager::ApplyConfigurationUpdate(const TiXmlDocument& document) {
   PublishConfigSettings(true);
   ProfileStatusDocument status;
   for (int32_t id : ProfilesToReset(previous, m_config)) {
-    ReportProfileStatus(status, id, kProfileStatusUnknown, m_callback);
+    ReportProfileStatus(status, id, kProfileStatusUnknown, m_env.WallSeconds(), m_callback);
   }
   if (previous.EmailSizeLimitMB() != m_config.EmailSizeLimitMB()) {
     SetVideoBufferLimit(m_config.EmailSizeLimitBytes());

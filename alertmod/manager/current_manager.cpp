@@ -9,6 +9,7 @@ namespace hx {
 namespace {
 
 std::atomic<NotifyManager*> g_current{nullptr};
+std::atomic<platform::Env*> g_installedEnv{nullptr};
 
 Mutex g_lentMutex;
 ConditionVariable g_lentLeft;
@@ -26,6 +27,18 @@ void SetCurrentManager(NotifyManager* manager) {
 
 NotifyManager* TakeCurrentManager() {
   return g_current.exchange(nullptr);
+}
+
+platform::Env& EnvForLoad() {
+  if (platform::Env* installed = g_installedEnv.load()) return *installed;
+  // Made at the first Load and kept until the library goes: the manager,
+  // the process service and the worker's job all hold on to it.
+  static const std::unique_ptr<platform::Env> system = platform::NewSystemEnv();
+  return *system;
+}
+
+void InstallEnvForLoad(platform::Env* env) {
+  g_installedEnv.store(env);
 }
 
 LentThreadScope::LentThreadScope() {

@@ -6,6 +6,8 @@
 #ifndef ALERTMOD_MANAGER_CURRENT_MANAGER_H_
 #define ALERTMOD_MANAGER_CURRENT_MANAGER_H_
 
+#include "alertmod/platform/env.h"
+
 namespace hx {
 
 class NotifyManager;
@@ -19,6 +21,15 @@ void SetCurrentManager(NotifyManager* manager);
 // Clears the live manager and returns what it was, so that exactly one
 // caller gets to destroy it. Called by the exports only.
 NotifyManager* TakeCurrentManager();
+
+// The Env that Load gives the manager it creates and the process service:
+// the operating system's, unless the testing build installed another.
+platform::Env& EnvForLoad();
+
+// Makes `env` the Env of later Loads; null restores the system's. Only the
+// testing build calls it, before Load; `env` must outlive the module's use
+// of it (until Unload).
+void InstallEnvForLoad(platform::Env* env);
 
 // Marks, for its lifetime, a lent thread (worker or watchdog) inside the
 // module. It must begin before that thread reads CurrentManager(): then

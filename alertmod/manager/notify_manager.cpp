@@ -6,16 +6,12 @@
 #include <exception>
 
 #include "alertmod/diag/log.h"
-#include "alertmod/platform/clock.h"
 #include "alertmod/video/av_libs.h"
 
 namespace hx {
 namespace {
 
-constexpr std::chrono::milliseconds kDefaultWatchdogPeriod{10000};
 constexpr std::chrono::milliseconds kRetryPollInterval{100};
-
-std::atomic<int64_t> g_watchdogPeriodMs{kDefaultWatchdogPeriod.count()};
 
 }  // namespace
 
@@ -23,12 +19,14 @@ void SNOTIFY_CALLBACK::OnReady() {
   m_manager->MoveToReady(this);
 }
 
-NotifyManager::NotifyManager(core::HostCallbackFn callback, WorkerJobFactory jobFactory)
+NotifyManager::NotifyManager(core::HostCallbackFn callback, platform::Env& env,
+                             WorkerJobFactory jobFactory)
     : m_callback(callback),
+      m_env(env),
       m_jobFactory(std::move(jobFactory)),
-      m_watchdogPeriod(g_watchdogPeriodMs.load()),
+      m_watchdogPeriod(env.WatchdogPeriod()),
       m_configServices(MakeConfigServices(callback)),
-      m_videoBuffer(callback) {
+      m_videoBuffer(callback, env) {
   GetLgr()->SetFileName("notifylog.txt");
   // The codec libraries are loaded while the host loads the module, so that
   // the first clip does not wait for them. Without them the module works on
@@ -44,10 +42,6 @@ NotifyManager::~NotifyManager() {
   // that the captures' frames go back to the host with the video buffer.
   for (const auto& callback : m_pending) callback->m_item.reset();
   for (const auto& callback : m_ready) callback->m_item.reset();
-}
-
-void NotifyManager::SetWatchdogPeriod(std::chrono::milliseconds period) {
-  g_watchdogPeriodMs.store(period.count());
 }
 
 void NotifyManager::QueueWorkItem(std::shared_ptr<NotifyWorkItem> item, bool atFront) {
@@ -191,7 +185,7 @@ void NotifyManager::SendTick() {
 }
 
 void NotifyManager::OnTick() {
-  int64_t now = platform::WallSeconds();
+  int64_t now = m_env.WallSeconds();
   auto due = [now](const std::shared_ptr<SNOTIFY_CALLBACK>& c) { return c->m_deadline < now; };
   auto firstKept = std::stable_partition(m_pending.begin(), m_pending.end(), due);
   m_ready.insert(m_ready.end(), m_pending.begin(), firstKept);

@@ -27,6 +27,7 @@
 #include "alertmod/manager/stream_links.h"
 #include "alertmod/manager/throttle.h"
 #include "alertmod/manager/worker_job.h"
+#include "alertmod/platform/env.h"
 #include "alertmod/platform/mutex.h"
 #include "alertmod/platform/thread_annotations.h"
 #include "alertmod/video/notify_ready.h"
@@ -65,8 +66,10 @@ struct CaptureContext;
 
 class NotifyManager {
  public:
-  // `callback` reaches the host; `jobFactory` makes the job of each worker run.
-  NotifyManager(core::HostCallbackFn callback, WorkerJobFactory jobFactory);
+  // `callback` reaches the host; `env` gives the clocks, files and time
+  // limits and must outlive the manager; `jobFactory` makes the job of each
+  // worker run.
+  NotifyManager(core::HostCallbackFn callback, platform::Env& env, WorkerJobFactory jobFactory);
   ~NotifyManager();
 
   NotifyManager(const NotifyManager&) = delete;
@@ -150,10 +153,8 @@ class NotifyManager {
   void PublishWorkerSettings(const WorkerSettings& settings, bool configurationReplaced)
       EXCLUDES(m_queueMutex);
 
-  // The watchdog's period for managers created from now on (default 10 s).
-  static void SetWatchdogPeriod(std::chrono::milliseconds period);
-
   core::HostCallbackFn Callback() const { return m_callback; }
+  platform::Env& GetEnv() const { return m_env; }
 
   // Replaces the job factory; the next RunWorker uses it. Tests only, and
   // only before the worker is entered.
@@ -195,6 +196,7 @@ class NotifyManager {
   static ConfigServices MakeConfigServices(core::HostCallbackFn callback);
 
   const core::HostCallbackFn m_callback;
+  platform::Env& m_env;
   WorkerJobFactory m_jobFactory;
   const std::chrono::milliseconds m_watchdogPeriod;
   const ConfigServices m_configServices;

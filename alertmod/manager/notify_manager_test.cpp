@@ -10,7 +10,7 @@
 #include <thread>
 #include <vector>
 
-#include "alertmod/platform/clock.h"
+#include "alertmod/platform/testing/manual_env.h"
 #include "tests/support/fake_host.h"
 
 namespace hx {
@@ -98,16 +98,15 @@ std::shared_ptr<NotifyWorkItem> Item(int64_t number) {
 class NotifyManagerTest : public ::testing::Test {
  protected:
   NotifyManagerTest()
-      : m_manager(m_host.callback(), [this] { return std::make_unique<RecordingJob>(&m_job); }) {
-    platform::SetWallSource(
-        [](void* c) { return static_cast<NotifyManagerTest*>(c)->m_now.load(); }, this);
+      : m_manager(m_host.callback(), m_env,
+                  [this] { return std::make_unique<RecordingJob>(&m_job); }) {
+    m_env.Reset(0, 1000);
   }
   ~NotifyManagerTest() override {
     if (m_worker.joinable()) {
       m_manager.Stop();
       m_worker.join();
     }
-    platform::SetWallSource(nullptr, nullptr);
   }
 
   void StartWorker() {
@@ -125,7 +124,7 @@ class NotifyManagerTest : public ::testing::Test {
 
   testsupport::FakeHost m_host;
   RecordingJob::Shared m_job;
-  std::atomic<int64_t> m_now{1000};
+  platform::ManualEnv m_env;
   NotifyManager m_manager;
   std::thread m_worker;
 };
@@ -235,7 +234,7 @@ TEST_F(NotifyManagerTest, TickReleasesOnlyNotificationsPastTheirDeadline) {
   m_manager.OnTick();
   EXPECT_EQ(m_manager.QueuedCount(), 1u);
   EXPECT_EQ(m_manager.PendingCount(), 2u);
-  m_now = 1001;
+  m_env.Reset(0, 1001);
   m_manager.OnTick();
   EXPECT_EQ(m_manager.QueuedCount(), 2u);
   // Ticks with nothing due change nothing.

@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "alertmod/manager/event_source_key.h"
+#include "alertmod/platform/testing/manual_env.h"
 #include "alertmod/video/video_buffer.h"
 #include "host/system_description.h"
 #include "tests/support/fake_host.h"
@@ -65,7 +66,8 @@ class StreamLinksTest : public ::testing::Test {
 
   testsupport::FakeHost host;
   HostSystemCatalogue catalogue = MakeCatalogue();
-  VideoBuffer buffer{host.callback()};
+  platform::ManualEnv env;
+  VideoBuffer buffer{host.callback(), env};
   WantedVideo wanted;
 };
 

@@ -9,7 +9,6 @@
 #include "alertmod/manager/catalogue.h"
 #include "alertmod/manager/event_source.h"
 #include "alertmod/manager/stream_links.h"
-#include "alertmod/platform/clock.h"
 #include "alertmod/video/video_buffer.h"
 
 namespace hx {
@@ -31,7 +30,7 @@ void AttachCapture(const CaptureContext& context, NotifyWorkItem& item, VideoSou
       MapSourceToStream(source.sourceKey, context.catalogue, context.wanted, context.callback);
   // The trigger is this very moment of the tick, which the buffer takes as
   // whole seconds and a millisecond part.
-  const uint32_t nowMs = platform::TickMs();
+  const uint32_t nowMs = context.env.TickMs();
   source.stream = context.buffer.AttachEmailStream(streamId, item.profile.preAlarmSeconds,
                                                    item.profile.maxVideoSeconds, nowMs / 1000,
                                                    static_cast<uint16_t>(nowMs % 1000), completion);

@@ -12,6 +12,7 @@
 
 #include "alertmod/host_records.h"
 #include "alertmod/mail/notify_work_item.h"
+#include "alertmod/platform/env.h"
 #include "alertmod/video/notify_ready.h"
 
 class TiXmlElement;
@@ -30,6 +31,7 @@ struct CaptureContext {
   const WantedVideo& wanted;
   const SourceAliases& aliases;
   core::HostCallbackFn callback;
+  platform::Env& env;  // the tick a capture is raised at
 };
 
 // Fills `item`'s source key, event type, source name and video sources from

@@ -11,6 +11,7 @@
 #include "alertmod/config/notify_cfg.h"
 #include "alertmod/host_records.h"
 #include "alertmod/mail/notify_work_item.h"
+#include "alertmod/platform/env.h"
 
 namespace hx {
 
@@ -44,8 +45,8 @@ class IWorkerJob {
 using WorkerJobFactory = std::function<std::unique_ptr<IWorkerJob>()>;
 
 // The job the module runs in production, reporting to the host through
-// `callback`.
-WorkerJobFactory DefaultWorkerJobFactory(core::HostCallbackFn callback);
+// `callback`, with the clocks and files of `env` (which must outlive it).
+WorkerJobFactory DefaultWorkerJobFactory(core::HostCallbackFn callback, platform::Env& env);
 
 }  // namespace hx
 

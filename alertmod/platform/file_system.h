@@ -2,8 +2,8 @@
 // directory creation and listing, file removal and the free space of a volume.
 //
 // Every call reports a failure as a Status; nothing throws. All calls may be
-// made from any thread. The free-space query is process-wide replaceable so
-// that tests can simulate a full disk.
+// made from any thread. Module code asks its Env for the free space, so that
+// a test can simulate a full disk.
 #ifndef ALERTMOD_PLATFORM_FILE_SYSTEM_H_
 #define ALERTMOD_PLATFORM_FILE_SYSTEM_H_
 
@@ -36,12 +36,6 @@ Status ListRegularFiles(const std::string& directory, std::vector<std::string>* 
 // Bytes available to an unprivileged caller on the volume of `directory`.
 // Fails when the volume cannot be queried; `bytes` is then unchanged.
 Status QueryFreeBytes(const std::string& directory, uint64_t* bytes);
-
-// Replaces the free-space query. A null `query` restores the system's query.
-// Install a replacement before the module starts work; it must be safe to
-// call from any thread.
-using FreeBytesQuery = Status (*)(void* context, const std::string& directory, uint64_t* bytes);
-void SetFreeBytesQuery(FreeBytesQuery query, void* context);
 
 }  // namespace platform
 }  // namespace hx

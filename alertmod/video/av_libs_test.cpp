@@ -12,6 +12,7 @@
 #include <sstream>
 #include <string>
 
+#include "alertmod/platform/testing/manual_env.h"
 #include "alertmod/video/clip_writer.h"
 #include "alertmod/video/testing/clip_media.h"
 #include "tests/support/fake_host.h"
@@ -207,7 +208,8 @@ class ClipLibrariesTest : public ::testing::Test {
   }
 
   bool WriteClip(av_init& libs, const std::string& path) {
-    return WriteVideoAttachment(1, m_clip->Stream(), path, m_host.callback(), libs);
+    return WriteVideoAttachment(1, m_clip->Stream(), path, m_host.callback(),
+                                *platform::SystemEnvForTests(), libs);
   }
 
   const cliptest::MediaRecipe m_recipe{kCodecH264, 320, 240, 10, 5};

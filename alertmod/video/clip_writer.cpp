@@ -85,7 +85,8 @@ void FeedFrames(const CVideoEmailStream& stream, videomake::CStreamInfo* info) {
 }  // namespace
 
 bool WriteVideoAttachment(uint32_t streamId, const CVideoEmailStream& stream,
-                          const std::string& path, core::HostCallbackFn callback, av_init& libs) {
+                          const std::string& path, core::HostCallbackFn callback,
+                          platform::Env& env, av_init& libs) {
   uint8_t packetCodec = 0;
   if (!PacketCodecFor(stream.Codec(), &packetCodec)) {
     LogToHost(core::kModuleId, callback, LogLevelWarning, "Invalid codec type received.");
@@ -96,7 +97,7 @@ bool WriteVideoAttachment(uint32_t streamId, const CVideoEmailStream& stream,
     const uint32_t lastMs = stream.LastFrameMs();
     const uint32_t spanMs = lastMs != firstMs ? lastMs - firstMs : 1;
     videomake::CStreamInfo info(streamId, packetCodec, stream.Width(), stream.Height(),
-                                ClipFps(stream, spanMs), path.c_str(), spanMs, callback, libs);
+                                ClipFps(stream, spanMs), path.c_str(), spanMs, callback, env, libs);
     info.SetExtent(ClipExtent(stream));
     FeedFrames(stream, &info);
     info.Close();
@@ -108,12 +109,13 @@ bool WriteVideoAttachment(uint32_t streamId, const CVideoEmailStream& stream,
   }
 }
 
-bool WriteJpegAttachment(const CVideoEmailStream& stream, const std::string& path) {
+bool WriteJpegAttachment(const CVideoEmailStream& stream, const std::string& path,
+                         platform::Env& env) {
   if (stream.Gops().empty() || stream.Gops().front().frames.empty() || path.empty()) return false;
   const Payload payload = PayloadOf(stream.Gops().front().frames.front());
   if (payload.data == nullptr) return false;
   platform::File file;
-  if (!platform::File::OpenForWriting(path, false, &file).ok()) return false;
+  if (!env.NewWritableFile(path, false, &file).ok()) return false;
   // A short write (a full disk) would mail a truncated picture.
   size_t written = 0;
   const bool wrote = file.Write(payload.data, payload.size, &written).ok();

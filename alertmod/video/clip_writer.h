@@ -12,6 +12,7 @@
 #include <string>
 
 #include "alertmod/host_records.h"
+#include "alertmod/platform/env.h"
 #include "alertmod/video/av_libs.h"
 #include "alertmod/video/video_email_stream.h"
 
@@ -30,14 +31,15 @@ namespace hx {
 // checks that the file exists. A file that could not be finished is removed.
 bool WriteVideoAttachment(uint32_t streamId, const CVideoEmailStream& stream,
                           const std::string& path, core::HostCallbackFn callback,
-                          av_init& libs = av_init::Instance());
+                          platform::Env& env, av_init& libs = av_init::Instance());
 
 // Writes the payload of the clip's first frame (the bytes from its payload
 // offset to the end of its buffer) to `path`, replacing any file there.
 // Returns false when the clip is empty, `path` is empty, the first frame has
 // lost its buffer or has no payload, or the file cannot be created or fully
 // written.
-bool WriteJpegAttachment(const CVideoEmailStream& stream, const std::string& path);
+bool WriteJpegAttachment(const CVideoEmailStream& stream, const std::string& path,
+                         platform::Env& env);
 
 }  // namespace hx
 

@@ -5,7 +5,7 @@
 #include <string>
 
 #include "alertmod/diag/log.h"
-#include "alertmod/platform/clock.h"
+#include "alertmod/platform/testing/manual_env.h"
 #include "alertmod/video/testing/clip_media.h"
 #include "tests/support/fake_host.h"
 #include "tests/support/temp_dir.h"
@@ -40,6 +40,7 @@ class ClipWriterTest : public ::testing::Test {
 
   testsupport::TempDir m_dir;
   testsupport::FakeHost m_host;
+  platform::ManualEnv m_env;
 };
 
 // The first bytes of `payload` as the container should hold them: for H.264
@@ -88,7 +89,7 @@ TEST_F(ClipWriterTest, ClipsPlayBackWithTheirStreamDescription) {
     for (size_t i = 0; i < frames.size(); ++i) before.push_back(clip.Buffer(i));
     const std::string path = m_dir.File(name + c.extension);
 
-    ASSERT_TRUE(WriteVideoAttachment(9, clip.Stream(), path, m_host.callback()));
+    ASSERT_TRUE(WriteVideoAttachment(9, clip.Stream(), path, m_host.callback(), m_env));
 
     const auto probe = cliptest::Probe(path);
     EXPECT_EQ(probe.at("codec_name"), c.codecName);
@@ -151,7 +152,7 @@ TEST_F(ClipWriterTest, FrameRateComesFromTheArrivalSpan) {
     const std::vector<MediaFrame> used(frames.begin(), frames.begin() + c.arrivals.size());
     HostClip clip(recipe, used, kHostHeader, c.arrivals);
     const std::string path = m_dir.File("rate.mov");
-    ASSERT_TRUE(WriteVideoAttachment(1, clip.Stream(), path, m_host.callback()));
+    ASSERT_TRUE(WriteVideoAttachment(1, clip.Stream(), path, m_host.callback(), m_env));
     const auto probe = cliptest::Probe(path);
     EXPECT_EQ(probe.at("r_frame_rate"), c.rate);
     EXPECT_EQ(probe.at("nb_read_packets"), std::to_string(c.arrivals.size()));
@@ -173,7 +174,7 @@ TEST_F(ClipWriterTest, LateKeyFramesAreLoggedAndWritten) {
   }
   HostClip clip(recipe, frames, kHostHeader, arrivals);
   const std::string path = m_dir.File("gap.mov");
-  ASSERT_TRUE(WriteVideoAttachment(4, clip.Stream(), path, m_host.callback()));
+  ASSERT_TRUE(WriteVideoAttachment(4, clip.Stream(), path, m_host.callback(), m_env));
 
   EXPECT_TRUE(Logged(core::kClipWriterLogSource, LogLevelError,
                      "Existing at full_ts - m_activeClip->LastFrame gap is 1640"));
@@ -188,7 +189,7 @@ TEST_F(ClipWriterTest, ArrivalTicksThatWrapKeepTheWholeClip) {
   // The eleventh frame arrives at tick 0 exactly.
   HostClip clip(recipe, frames, kHostHeader, 0u - 400u, 40);
   const std::string path = m_dir.File("wrap.mov");
-  ASSERT_TRUE(WriteVideoAttachment(2, clip.Stream(), path, m_host.callback()));
+  ASSERT_TRUE(WriteVideoAttachment(2, clip.Stream(), path, m_host.callback(), m_env));
   EXPECT_EQ(cliptest::Probe(path).at("nb_read_packets"), "25");
   EXPECT_EQ(cliptest::DecodeErrors(path), "");
 }
@@ -199,7 +200,7 @@ TEST_F(ClipWriterTest, CodecsWithoutAContainerAreRefused) {
     MediaRecipe recipe{codec, 320, 240, 1, 1};
     HostClip clip(recipe, {MediaFrame{{1, 2, 3}, true}}, kHostHeader, 100, 40);
     const std::string path = m_dir.File("refused.mov");
-    EXPECT_FALSE(WriteVideoAttachment(2, clip.Stream(), path, m_host.callback()));
+    EXPECT_FALSE(WriteVideoAttachment(2, clip.Stream(), path, m_host.callback(), m_env));
     EXPECT_FALSE(testsupport::FileExists(path));
   }
   EXPECT_TRUE(Logged(core::kModuleId, LogLevelWarning, "Invalid codec type received."));
@@ -211,7 +212,7 @@ TEST_F(ClipWriterTest, FilesThatCannotBeStartedAreLogged) {
   HostClip clip(recipe, frames, kHostHeader, 100, 40);
   for (const std::string& path : {m_dir.File("missing/clip.mov"), m_dir.File("clip.unknown")}) {
     SCOPED_TRACE(path);
-    EXPECT_TRUE(WriteVideoAttachment(12, clip.Stream(), path, m_host.callback()));
+    EXPECT_TRUE(WriteVideoAttachment(12, clip.Stream(), path, m_host.callback(), m_env));
     EXPECT_FALSE(testsupport::FileExists(path));
   }
   // One line per key frame: each retries the open.
@@ -235,20 +236,19 @@ TEST_F(ClipWriterTest, LongClipsKeepEveryFrame) {
   };
   const Case cases[] = {{10, "933ca41a31b1bebf0fbe946e6fc47f96ef58fe93add8871a826243800ed2874c"},
                         {180, nullptr}};
-  platform::SetWallSource([](void*) -> int64_t { return 1700000000; }, nullptr);
+  m_env.Reset(0, 1700000000);
   for (const Case& c : cases) {
     SCOPED_TRACE(c.seconds);
     const MediaRecipe recipe{kCodecH264, 64, 64, c.seconds * 30, 30};
     HostClip clip(recipe, Frames(recipe), kHostHeader, 100, 33);
     const std::string path = m_dir.File("long.mov");
-    EXPECT_TRUE(WriteVideoAttachment(5, clip.Stream(), path, m_host.callback()));
+    EXPECT_TRUE(WriteVideoAttachment(5, clip.Stream(), path, m_host.callback(), m_env));
     EXPECT_EQ(cliptest::Probe(path)["nb_read_packets"], std::to_string(recipe.frames));
     EXPECT_EQ(cliptest::DecodeErrors(path), "");
     if (c.sha256 != nullptr) {
       EXPECT_EQ(cliptest::RunCommand("sha256sum '" + path + "'", nullptr).substr(0, 64), c.sha256);
     }
   }
-  platform::SetWallSource(nullptr, nullptr);
 }
 
 TEST_F(ClipWriterTest, JpegStillIsThePayloadOfTheFirstFrame) {
@@ -262,7 +262,7 @@ TEST_F(ClipWriterTest, JpegStillIsThePayloadOfTheFirstFrame) {
   HostClip clip(recipe, {MediaFrame{still, true}, MediaFrame{{9, 9, 9}, true}}, kHostHeader, 100,
                 40);
   const std::string path = m_dir.File("attachment.jpg");
-  ASSERT_TRUE(WriteJpegAttachment(clip.Stream(), path));
+  ASSERT_TRUE(WriteJpegAttachment(clip.Stream(), path, m_env));
   EXPECT_EQ(cliptest::ReadBytes(path), still);
   EXPECT_EQ(cliptest::Probe(path).at("codec_name"), "mjpeg");
 }
@@ -289,7 +289,7 @@ TEST_F(ClipWriterTest, JpegStillFailures) {
       {"disk full", good, "/dev/full"},
   };
   for (const Case& c : cases) {
-    EXPECT_FALSE(WriteJpegAttachment(c.clip.Stream(), c.path)) << c.name;
+    EXPECT_FALSE(WriteJpegAttachment(c.clip.Stream(), c.path, m_env)) << c.name;
   }
 }
 

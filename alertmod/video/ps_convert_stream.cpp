@@ -7,7 +7,6 @@
 #include <cstring>
 #include <numeric>
 
-#include "alertmod/platform/clock.h"
 #include "alertmod/platform/utc_time.h"
 #include "alertmod/video/movie_header.h"
 
@@ -87,7 +86,8 @@ std::vector<int64_t> DisplayRanks(const std::vector<Frame>& gop, int unknown) {
 
 }  // namespace
 
-PSConvertAVCodecStream::PSConvertAVCodecStream(av_init& libs) : m_libs(libs) {}
+PSConvertAVCodecStream::PSConvertAVCodecStream(platform::Env& env, av_init& libs)
+    : m_env(env), m_libs(libs) {}
 
 PSConvertAVCodecStream::~PSConvertAVCodecStream() {
   Close();
@@ -157,7 +157,7 @@ bool PSConvertAVCodecStream::CreateOutput(const std::string& fileName) {
 }
 
 void PSConvertAVCodecStream::SetCreationTime() {
-  const std::string now = platform::FormatUtc(platform::WallSeconds(), kCreationTimeFormat);
+  const std::string now = platform::FormatUtc(m_env.WallSeconds(), kCreationTimeFormat);
   m_libs.av_dict_set(&m_context->metadata, "creation_time", now.c_str(), 0);
 }
 

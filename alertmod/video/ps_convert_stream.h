@@ -23,6 +23,7 @@
 #include <string>
 #include <vector>
 
+#include "alertmod/platform/env.h"
 #include "alertmod/video/av_libs.h"
 #include "alertmod/video/nal_units.h"
 #include "alertmod/video/ps_packet.h"
@@ -121,8 +122,8 @@ class IPSConvertStream {
 class PSConvertAVCodecStream final : public IPSConvertStream {
  public:
   // Uses `libs`, which must stay alive; every call fails cleanly when they
-  // are not all loaded.
-  explicit PSConvertAVCodecStream(av_init& libs = av_init::Instance());
+  // are not all loaded. The file's creation time is read from `env`.
+  explicit PSConvertAVCodecStream(platform::Env& env, av_init& libs = av_init::Instance());
   ~PSConvertAVCodecStream() override;
   PSConvertAVCodecStream(const PSConvertAVCodecStream&) = delete;
   PSConvertAVCodecStream& operator=(const PSConvertAVCodecStream&) = delete;
@@ -201,6 +202,7 @@ class PSConvertAVCodecStream final : public IPSConvertStream {
   void ReleaseParsers();
   void Release(bool removeFile);
 
+  platform::Env& m_env;
   av_init& m_libs;
   AVFormatContext* m_context = nullptr;
   AVDictionary* m_formatOptions = nullptr;

@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include "alertmod/platform/testing/manual_env.h"
 #include "alertmod/video/testing/clip_media.h"
 #include "tests/support/temp_dir.h"
 
@@ -64,7 +65,7 @@ TEST_F(StreamMuxerTest, PacketsWaitForTheParameterSets) {
   ASSERT_EQ(frames.size(), 20u);
   // Only the second key frame carries the parameter sets.
   frames[0].payload = WithoutParameterSets(frames[0].payload);
-  PSConvertAVCodecStream muxer;
+  PSConvertAVCodecStream muxer(*platform::SystemEnvForTests());
   const std::string path = m_dir.File("late.mov");
   ASSERT_EQ(muxer.Open(PSFileHeader(), OneVideoStream(kPSCodecH264, 320, 240, 25), path), 0);
   for (size_t i = 0; i < frames.size(); ++i) {
@@ -96,7 +97,7 @@ TEST_F(StreamMuxerTest, OpenFailsCleanly) {
     PSFileHeader header;
     header.primaryCodec = c.primaryCodec;
     header.streamFlags = c.streamFlags;
-    PSConvertAVCodecStream muxer;
+    PSConvertAVCodecStream muxer(*platform::SystemEnvForTests());
     const std::string path = m_dir.File(c.file);
     EXPECT_EQ(muxer.Open(header, OneVideoStream(c.codec, 320, 240, 25), path), kConvertOpenFailed);
     EXPECT_FALSE(testsupport::FileExists(path));
@@ -106,7 +107,7 @@ TEST_F(StreamMuxerTest, OpenFailsCleanly) {
 }
 
 TEST_F(StreamMuxerTest, DescribesItsStreams) {
-  PSConvertAVCodecStream muxer;
+  PSConvertAVCodecStream muxer(*platform::SystemEnvForTests());
   EXPECT_TRUE(muxer.CanWrite("a.mp4"));
   EXPECT_TRUE(muxer.CanWrite("a.mov"));
   EXPECT_FALSE(muxer.CanWrite("a.unknown"));
@@ -129,7 +130,7 @@ TEST_F(StreamMuxerTest, ARefusedHeaderIsNotRetried) {
   const cliptest::MediaRecipe recipe{kCodecH264, 320, 240, 3, 1};
   const std::vector<cliptest::MediaFrame> frames = cliptest::MakeFrames(recipe, m_dir.path());
   ASSERT_EQ(frames.size(), 3u);
-  PSConvertAVCodecStream muxer;
+  PSConvertAVCodecStream muxer(*platform::SystemEnvForTests());
   muxer.SetOptions({{"moov_size", "not a number", 0}});
   const std::string path = m_dir.File("refused.mov");
   ASSERT_EQ(muxer.Open(PSFileHeader(), OneVideoStream(kPSCodecH264, 320, 240, 25), path), 0);
@@ -146,7 +147,7 @@ TEST_F(StreamMuxerTest, AFileThatCannotBeFinishedIsRemoved) {
   const cliptest::MediaRecipe recipe{kCodecH264, 320, 240, 3, 1};
   const std::vector<cliptest::MediaFrame> frames = cliptest::MakeFrames(recipe, m_dir.path());
   ASSERT_EQ(frames.size(), 3u);
-  PSConvertAVCodecStream muxer;
+  PSConvertAVCodecStream muxer(*platform::SystemEnvForTests());
   // No room for the movie header, and no extent to raise it by.
   muxer.SetOptions({{"moov_size", "100", 0}});
   const std::string path = m_dir.File("unfinished.mov");

@@ -1,18 +1,12 @@
 #include "alertmod/video/stream_info.h"
 
 #include "alertmod/diag/log.h"
-#include "alertmod/platform/utc_time.h"
 #include "alertmod/video/ps_packet.h"
 
 namespace videomake {
 namespace {
 
 constexpr uint8_t kCodecByteBase = 128;
-
-std::string OutputPath(const char* path) {
-  if (path != nullptr) return path;
-  return hx::platform::TempDirectoryPath();
-}
 
 }  // namespace
 
@@ -23,15 +17,17 @@ const std::vector<hx::PSConvertOption>& ClipMuxerOptions() {
 
 CStreamInfo::CStreamInfo(uint32_t streamId, uint8_t codec, uint32_t width, uint32_t height,
                          uint32_t fps, const char* path, int64_t maxSpanMs,
-                         hx::core::HostCallbackFn callback, hx::av_init& libs)
+                         hx::core::HostCallbackFn callback, hx::platform::Env& env,
+                         hx::av_init& libs)
     : m_streamId(streamId),
       m_width(width),
       m_height(height),
       m_codec(codec < kCodecByteBase ? static_cast<uint8_t>(codec + kCodecByteBase) : codec),
       m_fps(fps),
       m_maxSpanMs(maxSpanMs),
-      m_path(OutputPath(path)),
+      m_path(path != nullptr ? path : env.TempDirectory()),
       m_callback(callback),
+      m_env(env),
       m_libs(libs) {}
 
 CStreamInfo::~CStreamInfo() {
@@ -102,7 +98,7 @@ void CStreamInfo::OpenClip(int64_t timeMs) {
   auto clip = std::make_unique<ActiveClip>();
   clip->FirstFrame = timeMs;
   clip->LastFrame = timeMs;
-  clip->muxer = std::make_unique<hx::PSConvertAVCodecStream>(m_libs);
+  clip->muxer = std::make_unique<hx::PSConvertAVCodecStream>(m_env, m_libs);
   clip->muxer->SetOptions(ClipMuxerOptions());
   const int result = clip->muxer->Open(hx::PSFileHeader(), *this, m_path);
   if (result != 0) {

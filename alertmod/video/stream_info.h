@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "alertmod/host_records.h"
+#include "alertmod/platform/env.h"
 #include "alertmod/video/av_libs.h"
 #include "alertmod/video/ps_convert_stream.h"
 
@@ -33,10 +34,11 @@ class CStreamInfo final : public hx::IPSConvertStreamInfo {
   // at `fps`, written to `path` (null: the temporary directory's path
   // itself), ending before the first key frame more than `maxSpanMs` after
   // the first frame. Logs through `callback` (may be null) and muxes through
-  // `libs`, which must outlive this object.
+  // `libs`; the temporary directory and the clock come from `env`. Both
+  // must outlive this object.
   CStreamInfo(uint32_t streamId, uint8_t codec, uint32_t width, uint32_t height, uint32_t fps,
               const char* path, int64_t maxSpanMs, hx::core::HostCallbackFn callback,
-              hx::av_init& libs = hx::av_init::Instance());
+              hx::platform::Env& env, hx::av_init& libs = hx::av_init::Instance());
   ~CStreamInfo() override;
   CStreamInfo(const CStreamInfo&) = delete;
   CStreamInfo& operator=(const CStreamInfo&) = delete;
@@ -95,6 +97,7 @@ class CStreamInfo final : public hx::IPSConvertStreamInfo {
   bool m_extentKnown = false;
   std::unique_ptr<ActiveClip> m_activeClip;
   hx::core::HostCallbackFn m_callback;
+  hx::platform::Env& m_env;
   hx::av_init& m_libs;
 };
 

@@ -4,6 +4,7 @@
 #include <stdlib.h>
 
 #include "alertmod/diag/log.h"
+#include "alertmod/platform/testing/manual_env.h"
 #include "alertmod/video/testing/clip_media.h"
 #include "tests/support/fake_host.h"
 #include "tests/support/temp_dir.h"
@@ -28,6 +29,7 @@ class StreamInfoTest : public ::testing::Test {
 
   testsupport::TempDir m_dir;
   testsupport::FakeHost m_host;
+  hx::platform::ManualEnv m_env;
   std::vector<cliptest::MediaFrame> m_frames;
 };
 
@@ -37,7 +39,7 @@ TEST_F(StreamInfoTest, DescribesOneStream) {
     uint8_t stored;
   };
   for (const Case c : {Case{5, 133}, Case{6, 134}, Case{132, 132}, Case{255, 255}}) {
-    CStreamInfo info(1, c.codec, 1920, 1080, 25, "x.mov", 1000, nullptr);
+    CStreamInfo info(1, c.codec, 1920, 1080, 25, "x.mov", 1000, nullptr, m_env);
     hx::PSStreamDescriptor descriptor;
     descriptor.unused = 0x5A;
     ASSERT_TRUE(info.GetStreamHeader(0, &descriptor));
@@ -53,7 +55,7 @@ TEST_F(StreamInfoTest, DescribesOneStream) {
 
 TEST_F(StreamInfoTest, FeedingFollowsKeyFramesAndTheSpan) {
   const std::string path = m_dir.File("span.mov");
-  CStreamInfo info(3, 5, 320, 240, 25, path.c_str(), 1000, m_host.callback());
+  CStreamInfo info(3, 5, 320, 240, 25, path.c_str(), 1000, m_host.callback(), m_env);
   EXPECT_FALSE(Write(info, 1, 900, 0));  // nothing before the first key frame
   EXPECT_TRUE(Write(info, 0, 1000, 1));  // opens the file
   EXPECT_TRUE(Write(info, 1, 1400, 0));
@@ -67,7 +69,7 @@ TEST_F(StreamInfoTest, FeedingFollowsKeyFramesAndTheSpan) {
 
 TEST_F(StreamInfoTest, WithoutPathTheTemporaryDirectoryIsTheName) {
   ASSERT_EQ(setenv("TMPDIR", m_dir.path().c_str(), 1), 0);
-  CStreamInfo info(3, 5, 320, 240, 25, nullptr, 1000, m_host.callback());
+  CStreamInfo info(3, 5, 320, 240, 25, nullptr, 1000, m_host.callback(), m_env);
   EXPECT_EQ(info.Path(), m_dir.path() + "/");
   // A directory names no container: the open fails and is logged, and the
   // caller is still asked for frames until the next key frame retries.

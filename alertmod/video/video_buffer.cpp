@@ -5,7 +5,6 @@
 #include <utility>
 
 #include "alertmod/diag/log.h"
-#include "alertmod/platform/clock.h"
 
 namespace hx {
 namespace {
@@ -57,8 +56,8 @@ void StreamBuffer::FinishAll() {
   for (size_t i = 0; i < m_attached.size(); ++i) m_attached[i]->Finish();
 }
 
-VideoBuffer::VideoBuffer(core::HostCallbackFn host, uint64_t maxBytes)
-    : m_host(host), m_maxBytes(maxBytes) {}
+VideoBuffer::VideoBuffer(core::HostCallbackFn host, platform::Env& env, uint64_t maxBytes)
+    : m_host(host), m_env(env), m_maxBytes(maxBytes) {}
 
 VideoBuffer::~VideoBuffer() = default;
 
@@ -76,7 +75,7 @@ bool VideoBuffer::AddFrame(int32_t streamId, uint32_t frameType, uint32_t payloa
   VideoFrame frame{0, frameType, payloadOffset, nullptr};
   try {
     frame.data = MakeFrameData(m_host, data, size);
-    frame.arrivalMs = platform::TickMs();
+    frame.arrivalMs = m_env.TickMs();
     if (StreamFor(streamId).AddFrame(frame, format)) return true;
   } catch (...) {
     // Out of memory part way: whoever took the frame before still holds it,

@@ -19,6 +19,7 @@
 #include <vector>
 
 #include "alertmod/host_records.h"
+#include "alertmod/platform/env.h"
 #include "alertmod/video/frame_data.h"
 #include "alertmod/video/gop_buffer.h"
 #include "alertmod/video/notify_ready.h"
@@ -59,8 +60,10 @@ class StreamBuffer {
 class VideoBuffer {
  public:
   // `host` receives the buffer releases and the log lines; it may be null
-  // (nothing is sent). `maxBytes` bounds each stream's history.
-  explicit VideoBuffer(core::HostCallbackFn host, uint64_t maxBytes = kDefaultVideoBufferBytes);
+  // (nothing is sent). `maxBytes` bounds each stream's history. Frames are
+  // stamped with the tick of `env`, which must outlive the buffer.
+  VideoBuffer(core::HostCallbackFn host, platform::Env& env,
+              uint64_t maxBytes = kDefaultVideoBufferBytes);
   ~VideoBuffer();
 
   VideoBuffer(const VideoBuffer&) = delete;
@@ -110,6 +113,7 @@ class VideoBuffer {
   void ReportMalformed(int32_t streamId, uint32_t payloadOffset, uint32_t size) noexcept;
 
   core::HostCallbackFn m_host;
+  platform::Env& m_env;  // the arrival tick of every frame
   uint64_t m_maxBytes;
   std::map<int32_t, StreamBuffer> m_streams;
   std::set<int32_t> m_malformedReported;

@@ -172,7 +172,7 @@ class PropertyRun {
   videotest::TestTick m_tick;
   std::mt19937 m_random;
   std::unique_ptr<hx::VideoBuffer> m_buffer =
-      std::make_unique<hx::VideoBuffer>(m_host.callback(), kLimit);
+      std::make_unique<hx::VideoBuffer>(m_host.callback(), m_tick, kLimit);
   std::vector<Camera> m_cameras;
   std::vector<Capture> m_captures;
   std::vector<bool> m_kept;

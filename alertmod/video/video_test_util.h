@@ -11,7 +11,7 @@
 #include <memory>
 #include <mutex>
 
-#include "alertmod/platform/clock.h"
+#include "alertmod/platform/testing/manual_env.h"
 #include "alertmod/video/frame_data.h"
 #include "alertmod/video/gop_buffer.h"
 #include "alertmod/video/notify_ready.h"
@@ -20,22 +20,13 @@
 
 namespace videotest {
 
-// The module's tick, set by the test while a TestTick lives; the system's
-// tick again once it is gone.
-class TestTick {
+// The Env of a buffer under test, whose tick (from 0) moves by hand.
+class TestTick : public hx::platform::ManualEnv {
  public:
-  TestTick() { hx::platform::SetTickSource(&TestTick::Read, nullptr); }
-  ~TestTick() { hx::platform::SetTickSource(nullptr, nullptr); }
-  void Set(uint32_t ms) { Now() = ms; }
-  void Advance(uint32_t ms) { Now() += ms; }
-  uint32_t Get() const { return Now(); }
-
- private:
-  static uint32_t& Now() {
-    static uint32_t now = 0;
-    return now;
-  }
-  static uint32_t Read(void*) { return Now(); }
+  TestTick() { SetTick(0); }
+  void Set(uint32_t ms) { SetTick(ms); }
+  void Advance(uint32_t ms) { SetTick(TickMs() + ms); }
+  uint32_t Get() { return TickMs(); }
 };
 
 // A FakeHost whose buffer releases are counted per buffer address.
@@ -140,7 +131,7 @@ class VideoBufferTest : public ::testing::Test {
 
   ReleaseCountingHost host;
   TestTick tick;
-  hx::VideoBuffer buffer{host.callback(), kLimit};
+  hx::VideoBuffer buffer{host.callback(), tick, kLimit};
   const void* lastBuffer = nullptr;
 
  private:

@@ -17,8 +17,6 @@ using Deadline = std::chrono::steady_clock::time_point;
 
 constexpr size_t kReadChunkBytes = 16384;
 
-std::atomic<int64_t> g_timeoutMs{kDefaultWebRequestTimeout.count()};
-
 // Runs `io` until the operation begun by `start` completes or `deadline`
 // passes. The client's synchronous contract is kept with asynchronous
 // operations because only they can be abandoned: on expiry the socket is
@@ -91,17 +89,6 @@ std::string ResolvableHost(const std::string& host) {
 }
 
 }  // namespace
-
-void SetWebRequestTimeout(std::chrono::milliseconds timeout) {
-  g_timeoutMs.store(std::max<int64_t>(timeout.count(), 0));
-}
-
-std::chrono::milliseconds WebRequestTimeout() {
-  return std::chrono::milliseconds(g_timeoutMs.load());
-}
-
-HttpGetClient::HttpGetClient(std::string host, std::string port)
-    : HttpGetClient(std::move(host), std::move(port), WebRequestTimeout()) {}
 
 HttpGetClient::HttpGetClient(std::string host, std::string port, std::chrono::milliseconds timeout)
     : m_host(std::move(host)), m_port(std::move(port)), m_timeout(timeout) {}

@@ -20,20 +20,12 @@
 
 namespace hx {
 
-constexpr std::chrono::milliseconds kDefaultWebRequestTimeout{10000};
-
-// The time-out of clients constructed afterwards (kDefaultWebRequestTimeout
-// until changed). Process-wide, any thread; tests shorten it.
-void SetWebRequestTimeout(std::chrono::milliseconds timeout);
-std::chrono::milliseconds WebRequestTimeout();
-
 class HttpGetClient {
  public:
   using Endpoints = std::vector<boost::asio::ip::tcp::endpoint>;
 
   // `host` is a name or address (an IPv6 address may keep its brackets);
-  // `port` is a service name or digits.
-  HttpGetClient(std::string host, std::string port);
+  // `port` is a service name or digits. `timeout` bounds each Get.
   HttpGetClient(std::string host, std::string port, std::chrono::milliseconds timeout);
   virtual ~HttpGetClient();
   HttpGetClient(const HttpGetClient&) = delete;

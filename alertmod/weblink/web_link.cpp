@@ -4,8 +4,8 @@
 #include <exception>
 #include <limits>
 
-#include "alertmod/util/base64.h"
 #include "alertmod/diag/log.h"
+#include "alertmod/util/base64.h"
 #include "alertmod/weblink/http_get_client.h"
 #include "alertmod/weblink/login_reply.h"
 
@@ -69,9 +69,10 @@ std::string CameraSearch(const std::string& serverId, int64_t eventTime,
 // Asks the web server for its systems. Returns false, with the failure
 // logged, when the exchange failed.
 bool FetchLoginReply(const WebServerAddress& web, const std::string& serial,
-                     core::HostCallbackFn callback, LoginReply& login) {
+                     core::HostCallbackFn callback, std::chrono::milliseconds timeout,
+                     LoginReply& login) {
   try {
-    HttpGetClient client(web.host, web.port);
+    HttpGetClient client(web.host, web.port, timeout);
     HttpResponse response;
     client.Get(kLoginPath, response);
     login = ParseLoginReply(response.body, serial);
@@ -89,9 +90,10 @@ bool FetchLoginReply(const WebServerAddress& web, const std::string& serial,
 }
 
 std::string BuildWebLink(const WebServerAddress& web, const std::string& serial, int64_t eventTime,
-                         const std::vector<uint32_t>& cameraKeys, core::HostCallbackFn callback) {
+                         const std::vector<uint32_t>& cameraKeys, core::HostCallbackFn callback,
+                         std::chrono::milliseconds timeout) {
   LoginReply login;
-  if (!FetchLoginReply(web, serial, callback, login)) return kUnreachable;
+  if (!FetchLoginReply(web, serial, callback, timeout, login)) return kUnreachable;
   if (!login.accepted) {
     LogToHost(core::kModuleId, callback, LogLevelWarning,
               "Incompaitble web server version. No link will be generated");
@@ -113,9 +115,10 @@ std::string BuildWebLink(const WebServerAddress& web, const std::string& serial,
 }  // namespace
 
 std::string MakeWebLink(const WebServerAddress& web, const std::string& serial, int64_t eventTime,
-                        const std::vector<uint32_t>& cameraKeys, core::HostCallbackFn callback) {
+                        const std::vector<uint32_t>& cameraKeys, core::HostCallbackFn callback,
+                        std::chrono::milliseconds timeout) {
   try {
-    return BuildWebLink(web, serial, eventTime, cameraKeys, callback);
+    return BuildWebLink(web, serial, eventTime, cameraKeys, callback, timeout);
   } catch (...) {
     // Only memory exhaustion can get here; the message still goes out.
     return kUnreachable;

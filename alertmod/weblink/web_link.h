@@ -8,6 +8,7 @@
 #ifndef ALERTMOD_WEBLINK_WEB_LINK_H_
 #define ALERTMOD_WEBLINK_WEB_LINK_H_
 
+#include <chrono>
 #include <cstdint>
 #include <string>
 #include <vector>
@@ -26,9 +27,11 @@ namespace hx {
 //                                    server identifier (warning);
 //   "[Connected to Web Server]"      found, but `cameraKeys` is empty.
 // The server is reached at web.host and web.port; the link names
-// web.address. Log lines go through `callback` (may be null).
+// web.address. Log lines go through `callback` (may be null). `timeout`
+// bounds the exchange (connection, request and reply).
 std::string MakeWebLink(const WebServerAddress& web, const std::string& serial, int64_t eventTime,
-                        const std::vector<uint32_t>& cameraKeys, core::HostCallbackFn callback);
+                        const std::vector<uint32_t>& cameraKeys, core::HostCallbackFn callback,
+                        std::chrono::milliseconds timeout);
 
 }  // namespace hx
 

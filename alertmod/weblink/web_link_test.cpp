@@ -2,8 +2,8 @@
 
 #include <gtest/gtest.h>
 
-#include "alertmod/util/base64.h"
 #include "alertmod/diag/log.h"
+#include "alertmod/util/base64.h"
 #include "alertmod/weblink/http_get_client.h"
 #include "tests/support/fake_host.h"
 #include "tests/support/web_server.h"
@@ -17,6 +17,7 @@ using testsupport::WebServer;
 constexpr int64_t kEventTime = 1700000000;
 constexpr char kSerial[] = "SN-1";
 const std::vector<uint32_t> kCameras = {5, 7};
+constexpr std::chrono::milliseconds kTimeout{10000};
 
 WebServerAddress AddressOf(const WebServer& server) {
   WebServerAddress web;
@@ -64,8 +65,8 @@ TEST(WebLinkTest, EncodesTheSearchTheReplyAsksFor) {
   for (const Case& c : cases) {
     server.SetLoginJson(c.reply);
     FakeHost host;
-    Link link =
-        SplitLink(MakeWebLink(AddressOf(server), kSerial, kEventTime, c.cameras, host.callback()));
+    Link link = SplitLink(
+        MakeWebLink(AddressOf(server), kSerial, kEventTime, c.cameras, host.callback(), kTimeout));
     EXPECT_EQ(link.prefix,
               "http://" + AddressOf(server).address + "/advanced.web?s=" + c.serverId + ";#")
         << c.name;
@@ -81,7 +82,8 @@ TEST(WebLinkTest, LinkNamesTheConfiguredAddressAndPort) {
   // A loopback address of its own keeps the fixed port clear of other tests.
   WebServer server("127.0.80.80", 8080);
   server.SetLoginJson(R"({"list":[{"id":"3","serial":"SN-1"}]})");
-  std::string link = MakeWebLink(AddressOf(server), kSerial, kEventTime, kCameras, nullptr);
+  std::string link =
+      MakeWebLink(AddressOf(server), kSerial, kEventTime, kCameras, nullptr, kTimeout);
   EXPECT_EQ(link.rfind("http://127.0.80.80:8080/advanced.web?s=3;#", 0), 0u) << link;
 }
 
@@ -119,7 +121,8 @@ TEST(WebLinkTest, SaysWhyThereIsNoLink) {
   for (const Case& c : cases) {
     server.SetReply(c.reply);
     FakeHost host;
-    EXPECT_EQ(MakeWebLink(web, kSerial, kEventTime, c.cameras, host.callback()), c.text) << c.name;
+    EXPECT_EQ(MakeWebLink(web, kSerial, kEventTime, c.cameras, host.callback(), kTimeout), c.text)
+        << c.name;
     std::vector<std::string> expected;
     if (!c.logged.empty()) {
       std::string line = c.logged;
@@ -139,7 +142,7 @@ TEST(WebLinkTest, UnreachableServerIsLoggedWithItsError) {
     web = AddressOf(gone);
   }
   FakeHost host;
-  EXPECT_EQ(MakeWebLink(web, kSerial, kEventTime, kCameras, host.callback()),
+  EXPECT_EQ(MakeWebLink(web, kSerial, kEventTime, kCameras, host.callback(), kTimeout),
             "[Web Server Unreachable]");
   EXPECT_EQ(
       host.LogTexts(LogLevelError),
@@ -150,19 +153,18 @@ TEST(WebLinkTest, UnreachableServerIsLoggedWithItsError) {
 // A server that takes the connection and never answers must not hold the
 // worker: the exchange ends at the time-out like any unreachable server.
 TEST(WebLinkTest, SilentServerEndsAtTheTimeout) {
-  SetWebRequestTimeout(std::chrono::milliseconds(300));
   WebServer server;
   server.SetSilent();
   FakeHost host;
   auto start = std::chrono::steady_clock::now();
-  EXPECT_EQ(MakeWebLink(AddressOf(server), kSerial, kEventTime, kCameras, host.callback()),
+  EXPECT_EQ(MakeWebLink(AddressOf(server), kSerial, kEventTime, kCameras, host.callback(),
+                        std::chrono::milliseconds(300)),
             "[Web Server Unreachable]");
   EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(3));
   EXPECT_EQ(host.LogTexts(LogLevelError),
             std::vector<std::string>{"Unable to communicate with webserver at address " +
                                      AddressOf(server).address +
                                      ". 110: read_until: Connection timed out"});
-  SetWebRequestTimeout(kDefaultWebRequestTimeout);
 }
 
 }  // namespace

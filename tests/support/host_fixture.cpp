@@ -13,40 +13,20 @@ std::string ProductionModulePath() {
   return ALERTMOD_MODULE_PATH;
 }
 
-FakeClock& FakeClock::Instance() {
-  static FakeClock* clock = new FakeClock();
-  return *clock;
-}
-
-void FakeClock::Install(refhost::ReferenceHost& host) {
-  auto setTick = reinterpret_cast<testhooks::SetTickSourceFn>(host.Hook("SetTickSource"));
-  auto setWall = reinterpret_cast<testhooks::SetWallSourceFn>(host.Hook("SetWallSource"));
-  ASSERT_NE(setTick, nullptr);
-  ASSERT_NE(setWall, nullptr);
-  setTick([](void* c) { return static_cast<FakeClock*>(c)->TickMs(); }, this);
-  setWall([](void* c) { return static_cast<FakeClock*>(c)->WallSeconds(); }, this);
-}
-
-void FakeClock::Reset(uint32_t tickMs, int64_t wallSeconds) {
-  m_tickMs.store(tickMs);
-  m_wallMs.store(wallSeconds * 1000);
-}
-
-void FakeClock::Advance(std::chrono::milliseconds step) {
-  m_tickMs.fetch_add(static_cast<uint32_t>(step.count()));
-  m_wallMs.fetch_add(step.count());
-}
-
 void ModuleHostTest::SetUp() {
   m_dir = std::make_unique<TempDir>();
   m_chdir = std::make_unique<ScopedChdir>(m_dir->path());
   m_options.modulePath = TestingModulePath();
   m_options.echoLog = getenv("ALERTMOD_TEST_ECHO_LOG") != nullptr;
-  FakeClock::Instance().Reset(0x10000, 1767225600);  // 2026-01-01 00:00:00 UTC
 }
 
 void ModuleHostTest::TearDown() {
-  if (m_host) m_host->Stop();
+  if (m_host) {
+    // A later host in this process must not find this test's Env; the
+    // loaded module keeps the one it was given until Unload.
+    if (m_host->Hook("InstallEnv") != nullptr) InstallEnv(nullptr);
+    m_host->Stop();
+  }
   m_host.reset();
   m_chdir.reset();
   m_dir.reset();
@@ -56,12 +36,15 @@ refhost::ReferenceHost& ModuleHostTest::CreateHost(uint32_t watchdogPeriodMs) {
   m_host = std::make_unique<refhost::ReferenceHost>(m_options);
   std::string error;
   EXPECT_TRUE(m_host->OpenLibrary(&error)) << error;
-  FakeClock::Instance().Install(*m_host);
-  auto setPeriod =
-      reinterpret_cast<testhooks::SetWatchdogPeriodMsFn>(m_host->Hook("SetWatchdogPeriodMs"));
-  EXPECT_NE(setPeriod, nullptr);
-  if (setPeriod != nullptr) setPeriod(watchdogPeriodMs == 0 ? 10000 : watchdogPeriodMs);
+  if (watchdogPeriodMs != 0) m_clock.SetWatchdogPeriod(std::chrono::milliseconds(watchdogPeriodMs));
+  InstallEnv(m_env);
   return *m_host;
+}
+
+void ModuleHostTest::InstallEnv(hx::platform::Env* env) {
+  auto install = reinterpret_cast<testhooks::InstallEnvFn>(m_host->Hook("InstallEnv"));
+  ASSERT_NE(install, nullptr);
+  install(env);
 }
 
 refhost::ReferenceHost& ModuleHostTest::StartHost(uint32_t watchdogPeriodMs) {

@@ -12,6 +12,7 @@
 #include <memory>
 #include <string>
 
+#include "alertmod/platform/testing/manual_env.h"
 #include "host/reference_host.h"
 #include "tests/support/temp_dir.h"
 
@@ -23,26 +24,6 @@ std::string ProductionModulePath();
 
 // Time as the module sees it, driven by the test. Lives for the whole process
 // because the module keeps a pointer to it.
-class FakeClock {
- public:
-  static FakeClock& Instance();
-
-  // Points the module's clocks at this one; needs the library opened.
-  void Install(refhost::ReferenceHost& host);
-  void Reset(uint32_t tickMs, int64_t wallSeconds);
-  // Moves the tick and the wall clock forward together.
-  void Advance(std::chrono::milliseconds step);
-  void SetTick(uint32_t tickMs) { m_tickMs.store(tickMs); }
-
-  uint32_t TickMs() const { return m_tickMs.load(); }
-  int64_t WallSeconds() const { return m_wallMs.load() / 1000; }
-
- private:
-  FakeClock() = default;
-  std::atomic<uint32_t> m_tickMs{0};
-  std::atomic<int64_t> m_wallMs{0};
-};
-
 class ModuleHostTest : public ::testing::Test {
  protected:
   void SetUp() override;
@@ -50,8 +31,9 @@ class ModuleHostTest : public ::testing::Test {
 
   // The options of the host made by CreateHost(); tests may change them first.
   refhost::HostOptions& Options() { return m_options; }
-  // Makes the host and opens the library, installing the fake clock and a
-  // watchdog period of `watchdogPeriodMs` (0 keeps the default).
+  // Makes the host and opens the library, installing the test's Env (the
+  // manual clock, or what UseEnv gave) with a watchdog period of
+  // `watchdogPeriodMs` (0 keeps the default).
   refhost::ReferenceHost& CreateHost(uint32_t watchdogPeriodMs = 0);
   // CreateHost, then Load, Open and the lent threads. Fails the test on error.
   refhost::ReferenceHost& StartHost(uint32_t watchdogPeriodMs = 0);
@@ -60,12 +42,22 @@ class ModuleHostTest : public ::testing::Test {
   bool WaitForLog(const std::string& fragment,
                   std::chrono::milliseconds timeout = std::chrono::seconds(20));
 
+  // Makes `env` the module's Env instead of the manual clock; call before
+  // CreateHost. `env` normally wraps clock() and must outlive the host.
+  void UseEnv(hx::platform::Env* env) { m_env = env; }
+
   refhost::ReferenceHost& host() { return *m_host; }
-  FakeClock& clock() { return FakeClock::Instance(); }
+  // The module's clocks, which move only when the test moves them (from
+  // 2026-01-01 00:00:00 UTC).
+  hx::platform::ManualEnv& clock() { return m_clock; }
   const TempDir& dir() const { return *m_dir; }
 
  private:
+  void InstallEnv(hx::platform::Env* env);
+
   refhost::HostOptions m_options;
+  hx::platform::ManualEnv m_clock;
+  hx::platform::Env* m_env = &m_clock;
   std::unique_ptr<TempDir> m_dir;
   std::unique_ptr<ScopedChdir> m_chdir;
   std::unique_ptr<refhost::ReferenceHost> m_host;

@@ -2,6 +2,9 @@
 // the production module plus one more export, AlertmodTestHook(name), which
 // returns the hook registered under `name` or null. This header gives the
 // names and the function types; it includes nothing of the module.
+//
+// The module's clocks, files and time limits are replaced as one Env
+// ("InstallEnv"); the other hooks reach the live manager.
 #ifndef ALERTMOD_TESTS_SUPPORT_MODULE_HOOKS_H_
 #define ALERTMOD_TESTS_SUPPORT_MODULE_HOOKS_H_
 
@@ -10,17 +13,17 @@
 #include <utility>
 #include <vector>
 
+namespace hx {
+namespace platform {
+class Env;
+}  // namespace platform
+}  // namespace hx
+
 namespace testhooks {
 
-// "SetTickSource": replaces the 32-bit millisecond tick (null restores).
-using SetTickSourceFn = void (*)(uint32_t (*source)(void* context), void* context);
-// "SetWallSource": replaces the wall clock in seconds (null restores).
-using SetWallSourceFn = void (*)(int64_t (*source)(void* context), void* context);
-// "SetWatchdogPeriodMs": the watchdog period of managers created afterwards.
-using SetWatchdogPeriodMsFn = void (*)(uint32_t periodMs);
-// "SetWebRequestTimeoutMs": the bound on one web server exchange of web
-// links made afterwards.
-using SetWebRequestTimeoutMsFn = void (*)(uint32_t timeoutMs);
+// "InstallEnv": the Env of later Loads (clocks, files, time limits); null
+// restores the system's. It must stay alive until Unload.
+using InstallEnvFn = void (*)(hx::platform::Env* env);
 
 // "ApplyConfigurationUpdate": parses `text` as a host document and applies it
 // to the live manager as a configuration update. 1 accepted, 0 rejected by
@@ -42,18 +45,6 @@ struct ProcessRunResult {
 // process-service client, on the calling thread, and waits for the end.
 using RunProcessFn = void (*)(const std::vector<std::string>& arguments, const std::string& input,
                               ProcessRunResult& result);
-// "SetLastProcessId": sets the last process id issued, so that the next start
-// takes the id after it.
-using SetLastProcessIdFn = void (*)(uint32_t id);
-// "SetStartAnswerTimeoutMs": how long program starts made afterwards wait
-// for the host's answer before the program counts as not started.
-using SetStartAnswerTimeoutMsFn = void (*)(uint32_t timeoutMs);
-
-// "SetFreeBytesQuery": replaces the free-space query of the data volume;
-// the query fills `bytes` and returns true, or returns false when the volume
-// cannot be queried. Null restores the system's query.
-using FreeBytesFn = bool (*)(void* context, uint64_t* bytes);
-using SetFreeBytesQueryFn = void (*)(FreeBytesFn query, void* context);
 
 // What a recorded work item carries, as the worker receives it.
 struct CapturedVideoRecord {
@@ -72,6 +63,7 @@ struct CapturedVideoRecord {
   uint32_t triggerMs = 0;
 };
 struct WorkItemRecord {
+  bool marker = false;  // queued by "QueueMarker"; nothing else is set
   uint32_t type = 0;
   int32_t profileId = 0;
   std::string profileDescription;
@@ -100,6 +92,11 @@ using WorkItemRecorderFn = void (*)(const WorkItemRecord& record, void* context)
 // `recorder`. Call after Load and before the worker thread is lent. False
 // without a manager.
 using SetWorkItemRecorderFn = bool (*)(WorkItemRecorderFn recorder, void* context);
+
+// "QueueMarker": queues a marker behind every item queued so far; the
+// recorder receives it, in turn, as a record with `marker` set. Call on the
+// host's dispatcher thread. False without a manager.
+using QueueMarkerFn = bool (*)();
 
 // "SetWorkerDropsItems": makes the live manager's worker drop every item
 // unsent (for benchmarks). Call after Load and before the worker thread is

@@ -21,7 +21,7 @@
 
 #include "alertmod/host_records.h"
 #include "alertmod/manager/notify_manager.h"
-#include "alertmod/platform/clock.h"
+#include "alertmod/platform/testing/manual_env.h"
 #include "tests/support/fuzz_scratch.h"
 
 namespace {
@@ -46,6 +46,16 @@ void Check(bool condition) {
 
 uint32_t g_tickMs = 0;
 int64_t g_wallSeconds = 0;
+
+// The fuzz input's clocks.
+class InputClockEnv final : public hx::platform::EnvWrapper {
+ public:
+  InputClockEnv() : EnvWrapper(hx::platform::SystemEnvForTests()) {}
+  uint32_t TickMs() override { return g_tickMs; }
+  int64_t WallSeconds() override { return g_wallSeconds; }
+};
+
+InputClockEnv g_env;
 std::map<const void*, int> g_releases;
 
 int32_t HostCallback(hx::core::HostRequest* request, void*) {
@@ -68,7 +78,7 @@ uint8_t g_frames[kMaxFramesPerInput];
 
 class Session {
  public:
-  Session() : m_manager(&HostCallback, &NoJob) {
+  Session() : m_manager(&HostCallback, g_env, &NoJob) {
     TiXmlDocument profiles;
     profiles.Parse(kProfiles);
     Check(m_manager.ApplyConfigurationUpdate(profiles));
@@ -127,8 +137,6 @@ class Session {
 extern "C" int LLVMFuzzerInitialize(int* argc, char*** argv) {
   // Configuration changes save "notify.xml" in the working directory.
   testsupport::MoveToFuzzScratchDirectory(argc, argv, "documents_fuzz");
-  hx::platform::SetTickSource([](void*) { return g_tickMs; }, nullptr);
-  hx::platform::SetWallSource([](void*) { return g_wallSeconds; }, nullptr);
   return 0;
 }
 

@@ -27,7 +27,7 @@
 
 #include "alertmod/host_records.h"
 #include "alertmod/manager/notify_manager.h"
-#include "alertmod/platform/clock.h"
+#include "alertmod/platform/testing/manual_env.h"
 #include "host/system_description.h"
 #include "tests/support/fake_host.h"
 #include "tests/support/fuzz_input.h"
@@ -45,6 +45,16 @@ void Check(bool condition) {
 
 uint32_t g_tickMs = 0;
 int64_t g_wallSeconds = 0;
+
+// The fuzz input's clocks.
+class InputClockEnv final : public hx::platform::EnvWrapper {
+ public:
+  InputClockEnv() : EnvWrapper(hx::platform::SystemEnvForTests()) {}
+  uint32_t TickMs() override { return g_tickMs; }
+  int64_t WallSeconds() override { return g_wallSeconds; }
+};
+
+InputClockEnv g_env;
 
 std::unique_ptr<hx::IWorkerJob> NoJob() {
   return nullptr;
@@ -100,7 +110,7 @@ using Reader = testsupport::FuzzInput;
 class Session {
  public:
   explicit Session(testsupport::FakeHost& host)
-      : m_manager(host.callback(), &NoJob), m_streams(StreamIds()) {
+      : m_manager(host.callback(), g_env, &NoJob), m_streams(StreamIds()) {
     Document(SizeLimitDocument(1));
     Document(refhost::BuildSystemDocument(System(false)));
   }
@@ -227,8 +237,6 @@ class Session {
 
 extern "C" int LLVMFuzzerInitialize(int* argc, char*** argv) {
   testsupport::MoveToFuzzScratchDirectory(argc, argv, "frame_records_fuzz");
-  hx::platform::SetTickSource([](void*) { return g_tickMs; }, nullptr);
-  hx::platform::SetWallSource([](void*) { return g_wallSeconds; }, nullptr);
   return 0;
 }
 

@@ -8,43 +8,13 @@
 #include <cerrno>
 #include <climits>
 #include <memory>
-#include <mutex>
 
 namespace hx {
 namespace platform {
 namespace {
 
-// The replacement query and its context, read and written as one pair. A
-// query of free space is rare enough for a lock.
-struct FreeBytesSource {
-  std::mutex mutex;
-  FreeBytesQuery query = nullptr;
-  void* context = nullptr;
-};
-
-FreeBytesSource& TheFreeBytesSource() {
-  static FreeBytesSource source;
-  return source;
-}
-
 Status ErrnoFailure(const char* action, const std::string& path, int error) {
   return Status::FromErrno(std::string(action) + " \"" + path + "\"", error);
-}
-
-Status SystemFreeBytes(const std::string& directory, uint64_t* bytes) {
-  struct statvfs volume {};
-  if (statvfs(directory.c_str(), &volume) != 0) {
-    return ErrnoFailure("cannot query the volume of", directory, errno);
-  }
-  uint64_t available = 0;
-  // A product that does not fit is reported as "all bits set", the value a
-  // volume without a known size gives.
-  if (__builtin_mul_overflow(static_cast<uint64_t>(volume.f_bavail),
-                             static_cast<uint64_t>(volume.f_frsize), &available)) {
-    available = UINT64_MAX;
-  }
-  *bytes = available;
-  return Status::OK();
 }
 
 bool IsDirectory(const std::string& path) {
@@ -98,22 +68,19 @@ Status ListRegularFiles(const std::string& directory, std::vector<std::string>* 
 }
 
 Status QueryFreeBytes(const std::string& directory, uint64_t* bytes) {
-  FreeBytesSource& source = TheFreeBytesSource();
-  FreeBytesQuery query;
-  void* context;
-  {
-    std::lock_guard<std::mutex> lock(source.mutex);
-    query = source.query;
-    context = source.context;
+  struct statvfs volume {};
+  if (statvfs(directory.c_str(), &volume) != 0) {
+    return ErrnoFailure("cannot query the volume of", directory, errno);
   }
-  return query ? query(context, directory, bytes) : SystemFreeBytes(directory, bytes);
-}
-
-void SetFreeBytesQuery(FreeBytesQuery query, void* context) {
-  FreeBytesSource& source = TheFreeBytesSource();
-  std::lock_guard<std::mutex> lock(source.mutex);
-  source.query = query;
-  source.context = context;
+  uint64_t available = 0;
+  // A product that does not fit is reported as "all bits set", the value a
+  // volume without a known size gives.
+  if (__builtin_mul_overflow(static_cast<uint64_t>(volume.f_bavail),
+                             static_cast<uint64_t>(volume.f_frsize), &available)) {
+    available = UINT64_MAX;
+  }
+  *bytes = available;
+  return Status::OK();
 }
 
 }  // namespace platform

@@ -5,7 +5,6 @@
 #undef DeleteFile
 
 #include <cerrno>
-#include <mutex>
 
 #include "alertmod/platform/win32/system_error.h"
 
@@ -13,32 +12,8 @@ namespace hx {
 namespace platform {
 namespace {
 
-// The replacement query and its context, read and written as one pair. A
-// query of free space is rare enough for a lock.
-struct FreeBytesSource {
-  std::mutex mutex;
-  FreeBytesQuery query = nullptr;
-  void* context = nullptr;
-};
-
-FreeBytesSource& TheFreeBytesSource() {
-  static FreeBytesSource source;
-  return source;
-}
-
 Status Failure(const char* action, const std::string& path, DWORD error) {
   return Win32Failure(std::string(action) + " \"" + path + "\"", error);
-}
-
-Status SystemFreeBytes(const std::string& directory, uint64_t* bytes) {
-  // The first figure is what the calling user may still use, quotas
-  // included.
-  ULARGE_INTEGER available{};
-  if (!GetDiskFreeSpaceExA(directory.c_str(), &available, nullptr, nullptr)) {
-    return Failure("cannot query the volume of", directory, GetLastError());
-  }
-  *bytes = available.QuadPart;
-  return Status::OK();
 }
 
 bool IsDirectory(const std::string& path) {
@@ -84,8 +59,9 @@ Status DeleteFile(const std::string& path) {
 Status ListRegularFiles(const std::string& directory, std::vector<std::string>* names) {
   WIN32_FIND_DATAA entry{};
   HANDLE find = FindFirstFileA((directory + "\\*").c_str(), &entry);
-  if (find == INVALID_HANDLE_VALUE)
+  if (find == INVALID_HANDLE_VALUE) {
     return Failure("cannot read directory", directory, GetLastError());
+  }
   names->clear();
   do {
     if (IsRegularEntry(entry)) names->emplace_back(entry.cFileName);
@@ -97,22 +73,14 @@ Status ListRegularFiles(const std::string& directory, std::vector<std::string>* 
 }
 
 Status QueryFreeBytes(const std::string& directory, uint64_t* bytes) {
-  FreeBytesSource& source = TheFreeBytesSource();
-  FreeBytesQuery query;
-  void* context;
-  {
-    std::lock_guard<std::mutex> lock(source.mutex);
-    query = source.query;
-    context = source.context;
+  // The first figure is what the calling user may still use, quotas
+  // included.
+  ULARGE_INTEGER available{};
+  if (!GetDiskFreeSpaceExA(directory.c_str(), &available, nullptr, nullptr)) {
+    return Failure("cannot query the volume of", directory, GetLastError());
   }
-  return query ? query(context, directory, bytes) : SystemFreeBytes(directory, bytes);
-}
-
-void SetFreeBytesQuery(FreeBytesQuery query, void* context) {
-  FreeBytesSource& source = TheFreeBytesSource();
-  std::lock_guard<std::mutex> lock(source.mutex);
-  source.query = query;
-  source.context = context;
+  *bytes = available.QuadPart;
+  return Status::OK();
 }
 
 }  // namespace platform

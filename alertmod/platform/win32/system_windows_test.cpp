@@ -4,7 +4,7 @@
 // timeapi.h needs windows.h before it.
 #include <timeapi.h>
 
-#include "alertmod/platform/clock.h"
+#include "alertmod/platform/env.h"
 #include "alertmod/platform/shared_library.h"
 #include "alertmod/platform/utc_time.h"
 #include "tests/support/temp_dir.h"
@@ -16,8 +16,9 @@ namespace {
 // The tick is timeGetTime's own 32-bit count, so it wraps with it after 49.7
 // days; the unsigned differences below hold across that wrap too.
 TEST(WindowsSystemTest, TickIsTimeGetTime) {
+  std::unique_ptr<Env> env = NewSystemEnv();
   const DWORD before = timeGetTime();
-  const uint32_t tick = TickMs();
+  const uint32_t tick = env->TickMs();
   const DWORD after = timeGetTime();
   EXPECT_LE(static_cast<uint32_t>(tick - before), static_cast<uint32_t>(after - before));
 }
@@ -28,7 +29,7 @@ TEST(WindowsSystemTest, TempDirectoryIsGetTempPath) {
   const bool hadTmp = GetEnvironmentVariableA("TMP", saved, sizeof(saved)) > 0;
   for (const std::string& tmp : {dir.path(), dir.path() + "\\"}) {
     ASSERT_TRUE(SetEnvironmentVariableA("TMP", tmp.c_str()));
-    EXPECT_EQ(TempDirectoryPath(), dir.path() + "\\") << tmp;
+    EXPECT_EQ(NewSystemEnv()->TempDirectory(), dir.path() + "\\") << tmp;
   }
   SetEnvironmentVariableA("TMP", hadTmp ? saved : nullptr);
 }

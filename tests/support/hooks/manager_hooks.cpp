@@ -11,6 +11,9 @@
 namespace testhooks {
 namespace {
 
+// No profile of a configuration has this id.
+constexpr int32_t kMarkerProfileId = INT32_MIN;
+
 CapturedVideoRecord RecordVideo(const hx::VideoSource& source) {
   CapturedVideoRecord record;
   record.sourceKey = source.sourceKey;
@@ -70,6 +73,12 @@ class RecordingJob final : public hx::IWorkerJob {
     m_inner->OnSettingsChanged(settings, configurationReplaced);
   }
   void Run(hx::NotifyWorkItem& item) override {
+    if (item.profile.id == kMarkerProfileId) {
+      WorkItemRecord marker;
+      marker.marker = true;
+      m_recorder(marker, m_context);
+      return;
+    }
     m_recorder(RecordItem(item), m_context);
     m_inner->Run(item);
   }
@@ -82,10 +91,19 @@ class RecordingJob final : public hx::IWorkerJob {
   void* m_context;
 };
 
+bool QueueMarker() {
+  hx::NotifyManager* manager = hx::CurrentManager();
+  if (manager == nullptr) return false;
+  auto marker = std::make_shared<hx::NotifyWorkItem>(hx::kWorkItemNotification);
+  marker->profile.id = kMarkerProfileId;
+  manager->QueueWorkItem(std::move(marker), false);
+  return true;
+}
+
 bool SetWorkItemRecorder(WorkItemRecorderFn recorder, void* context) {
   hx::NotifyManager* manager = hx::CurrentManager();
   if (manager == nullptr || recorder == nullptr) return false;
-  hx::WorkerJobFactory inner = hx::DefaultWorkerJobFactory(manager->Callback());
+  hx::WorkerJobFactory inner = hx::DefaultWorkerJobFactory(manager->Callback(), manager->GetEnv());
   manager->SetWorkerJobFactory([inner, recorder, context] {
     return std::make_unique<RecordingJob>(inner(), recorder, context);
   });
@@ -138,6 +156,7 @@ bool GetManagerState(ManagerStateRecord& state) {
 }
 
 HookRegistrar g_recorder("SetWorkItemRecorder", AsHook(&SetWorkItemRecorder));
+HookRegistrar g_marker("QueueMarker", AsHook(&QueueMarker));
 HookRegistrar g_state("GetManagerState", AsHook(&GetManagerState));
 HookRegistrar g_dropping("SetWorkerDropsItems", AsHook(&SetWorkerDropsItems));
 

@@ -11,13 +11,7 @@ void RunProcess(const std::vector<std::string>& arguments, const std::string& in
       hx::ipc::RunProcess(arguments, input, result.exitCode, result.errorLines, &result.output);
 }
 
-void SetStartAnswerTimeoutMs(uint32_t timeoutMs) {
-  hx::ipc::SetStartAnswerTimeout(std::chrono::milliseconds(timeoutMs));
-}
-
 HookRegistrar g_runProcess("RunProcess", AsHook(&RunProcess));
-HookRegistrar g_lastProcessId("SetLastProcessId", AsHook(&hx::ipc::SetLastProcessId));
-HookRegistrar g_startAnswerTimeout("SetStartAnswerTimeoutMs", AsHook(&SetStartAnswerTimeoutMs));
 
 }  // namespace
 }  // namespace testhooks
