@@ -1,6 +1,7 @@
 #include "alertmod/mail/mail_file.h"
 
 #include <algorithm>
+#include <cstdio>
 #include <ctime>
 #include <exception>
 #include <mutex>
@@ -10,6 +11,7 @@
 #include "alertmod/mail/notify_file.h"
 #include "alertmod/platform/file_system.h"
 #include "alertmod/platform/local_time.h"
+#include "alertmod/platform/utc_time.h"
 #include "alertmod/util/base64.h"
 
 namespace hx {
@@ -19,7 +21,13 @@ namespace {
 // bare LF), so every line the composer writes ends with it.
 constexpr char kCrLf[] = "\r\n";
 constexpr size_t kCrLfChars = sizeof(kCrLf) - 1;
-constexpr char kDateFormat[] = "%a, %d %b %Y %T %z (%Z)";
+// The date line's parts around the zone's offset. C99's "%T" and "%z" are
+// not used: the Windows C runtime knows no "%T" and writes the zone's name
+// for "%z", so the time is spelled out and the offset computed.
+constexpr char kDateFormat[] = "%a, %d %b %Y %H:%M:%S";
+constexpr char kZoneNameFormat[] = " (%Z)";
+constexpr int kSecondsPerHour = 3600;
+constexpr int kSecondsPerMinute = 60;
 constexpr char kImageType[] = "image/jpeg";
 constexpr char kVideoType[] = "video/quicktime";
 constexpr char kAddressPattern[] = "[a-zA-Z0-9.!#$%&'*+/=?^_`{}|~-]+@[a-zA-Z0-9.-]+";
@@ -65,13 +73,29 @@ std::string MailFileName(const NotifyWorkItem& item, uint32_t part, uint32_t tot
   return name;
 }
 
+// "+hhmm" or "-hhmm": how far the local fields `local` of `seconds` are
+// ahead of UTC.
+std::string UtcOffsetText(int64_t seconds, const std::tm& local) {
+  const int64_t ahead = platform::UtcSeconds(local) - seconds;
+  const int64_t magnitude = ahead < 0 ? -ahead : ahead;
+  char text[16];
+  snprintf(text, sizeof(text), "%c%02d%02d", ahead < 0 ? '-' : '+',
+           static_cast<int>(magnitude / kSecondsPerHour),
+           static_cast<int>(magnitude % kSecondsPerHour / kSecondsPerMinute));
+  return text;
+}
+
 std::string DateLine(int64_t dateSeconds) {
   std::tm local{};
-  char text[128] = {0};
+  char date[128] = {0};
+  char zone[128] = {0};
+  std::string line = "Date: ";
   if (platform::LocalFields(dateSeconds, &local)) {
-    strftime(text, sizeof(text), kDateFormat, &local);
+    strftime(date, sizeof(date), kDateFormat, &local);
+    strftime(zone, sizeof(zone), kZoneNameFormat, &local);
+    line += date + (" " + UtcOffsetText(dateSeconds, local)) + zone;
   }
-  return std::string("Date: ") + text + kCrLf;
+  return line + kCrLf;
 }
 
 // Extracts every address of `texts` into the recipients and, when `label` is

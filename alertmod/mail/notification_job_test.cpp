@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <regex>
 
 #include "alertmod/diag/log.h"
 #include "alertmod/mail/delivery_test_util.h"
@@ -112,6 +113,12 @@ TEST_F(NotificationJobTest, PlainMessageIsSentAndRemoved) {
   EXPECT_TRUE(m_writer.paths.empty());
   EXPECT_EQ(m_helper.statuses, (std::vector<std::pair<int32_t, int32_t>>{{3, 0}}));
   EXPECT_TRUE(DataFiles().empty());
+  // A whole date with a numeric zone, whatever the C runtime's strftime knows.
+  ASSERT_EQ(m_helper.messages.size(), 1u);
+  EXPECT_TRUE(std::regex_search(m_helper.messages[0],
+                                std::regex("(^|\n)Date: [A-Z][a-z]{2}, [0-9]{2} [A-Z][a-z]{2} "
+                                           "[0-9]{4} [0-9]{2}:[0-9]{2}:[0-9]{2} [+-][0-9]{4} \\(")))
+      << m_helper.messages[0];
 }
 
 TEST_F(NotificationJobTest, AttachmentNamesAndExtensions) {
