@@ -1,8 +1,8 @@
 #include "alertmod/diag/log.h"
 
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 
+#include <filesystem>
 #include <string>
 
 #include "tests/support/fake_host.h"
@@ -103,7 +103,7 @@ TEST(FileLoggerTest, ReopensAfterAFailedOpen) {
   logger.SetFileName("missing-dir/log.txt");
   EXPECT_FALSE(logger.Stream().good());
   // The same name is tried again at the next request, once it can be opened.
-  ASSERT_EQ(mkdir("missing-dir", 0755), 0);
+  ASSERT_TRUE(std::filesystem::create_directory("missing-dir"));
   logger.Stream() << "ok\n";
   logger.Stream().flush();
   EXPECT_TRUE(logger.Stream().good());

@@ -1,14 +1,13 @@
 #include "alertmod/mail/mail_file.h"
 
 #include <gtest/gtest.h>
-#include <sys/stat.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <clocale>
 #include <cstdio>
 #include <cstdlib>
 #include <ctime>
+#include <filesystem>
 #include <memory>
 
 #include "alertmod/platform/testing/manual_env.h"
@@ -23,6 +22,9 @@ using testsupport::ReadFile;
 using testsupport::WriteFile;
 
 constexpr char kPython[] = "/usr/bin/python3";
+// The zone of the expected texts, set with putenv: the Windows C runtime
+// has no setenv.
+constexpr char kTimeZone[] = "TZ=CET-1CEST,M3.5.0,M10.5.0/3";
 constexpr char kBoundaryLine[] = "--b1914efc629febb89915e8a6f83ba6eb";
 constexpr char kMessagePath[] = "./data/notify-mail-3-1700000000-250-7";
 
@@ -71,11 +73,11 @@ std::string ElideAttachments(const std::string& text) {
 class MailFileTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    setenv("TZ", "CET-1CEST,M3.5.0,M10.5.0/3", 1);
+    putenv(const_cast<char*>(kTimeZone));
     tzset();
     setlocale(LC_ALL, "C");
     m_chdir = std::make_unique<testsupport::ScopedChdir>(m_dir.path());
-    ASSERT_EQ(mkdir("data", 0777), 0);
+    ASSERT_TRUE(std::filesystem::create_directory("data"));
   }
 
   static NotifyWorkItem Item() {
@@ -347,7 +349,7 @@ TEST_F(MailFileTest, MissingDataDirectoryFailsTheOpen) {
 // volume there must fail the message instead of sending it truncated.
 TEST_F(MailFileTest, FullVolumeFailsTheMessage) {
   for (size_t attachmentBytes : {size_t{0}, size_t{5000000}}) {
-    ASSERT_EQ(symlink("/dev/full", kMessagePath), 0);
+    std::filesystem::create_symlink("/dev/full", kMessagePath);
     std::vector<MailAttachment> attachments;
     if (attachmentBytes > 0)
       attachments.push_back(Attachment("big.jpg", Bytes(attachmentBytes, 3)));
@@ -355,7 +357,7 @@ TEST_F(MailFileTest, FullVolumeFailsTheMessage) {
     MailFile mail;
     EXPECT_FALSE(ComposeMailFile(Item(), attachments, 0, 1, 7, kCompositionTime, stream, mail))
         << attachmentBytes;
-    ASSERT_EQ(unlink(kMessagePath), 0);
+    ASSERT_TRUE(std::filesystem::remove(kMessagePath));
   }
 }
 
@@ -428,7 +430,7 @@ TEST_F(MailFileTest, ClearDataDirectoryRemovesOnlyMessageFiles) {
                            "notify-mailx", "x-notify-mail-1"}) {
     ASSERT_TRUE(WriteFile(std::string("data/") + name, "x"));
   }
-  ASSERT_EQ(mkdir("data/notify-mail-dir", 0777), 0);
+  ASSERT_TRUE(std::filesystem::create_directory("data/notify-mail-dir"));
   ClearDataDirectory(m_host.callback());
   for (const char* gone : {"notify-mail-3-1-2-0", "notify-mail-x", "notify-mail-"}) {
     EXPECT_FALSE(FileExists(std::string("data/") + gone)) << gone;

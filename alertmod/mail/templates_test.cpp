@@ -15,13 +15,16 @@ namespace {
 
 // 2023-11-14 22:13:20 UTC, 23:13:20 in the zone below.
 constexpr int64_t kEventTime = 1700000000;
+// The zone of the expected texts, set with putenv: the Windows C runtime
+// has no setenv.
+constexpr char kTimeZone[] = "TZ=CET-1CEST,M3.5.0,M10.5.0/3";
 constexpr char kDate[] = "11/14/23";
 constexpr char kTime[] = "23:13:20";
 
 class TemplatesTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    setenv("TZ", "CET-1CEST,M3.5.0,M10.5.0/3", 1);
+    putenv(const_cast<char*>(kTimeZone));
     tzset();
     setlocale(LC_ALL, "C");
   }

@@ -33,8 +33,9 @@ Status AbsolutePath(const std::string& relative, std::string* absolute) {
   if (length == 0 || length > sizeof(buffer)) {
     return Failure("cannot read the current directory for", relative, GetLastError());
   }
+  // Joined with a slash, as the module's own paths are; Windows takes both.
   std::string base(buffer, length);
-  if (base.back() != '\\' && base.back() != '/') base += '\\';
+  if (base.back() != '\\' && base.back() != '/') base += '/';
   *absolute = base + relative;
   return Status::OK();
 }
@@ -60,7 +61,14 @@ Status ListRegularFiles(const std::string& directory, std::vector<std::string>* 
   WIN32_FIND_DATAA entry{};
   HANDLE find = FindFirstFileA((directory + "\\*").c_str(), &entry);
   if (find == INVALID_HANDLE_VALUE) {
-    return Failure("cannot read directory", directory, GetLastError());
+    const DWORD error = GetLastError();
+    // Windows finds no entries "in" a file; POSIX names that ENOTDIR, which
+    // callers must not take for a missing directory.
+    if (GetFileAttributesA(directory.c_str()) != INVALID_FILE_ATTRIBUTES &&
+        !IsDirectory(directory)) {
+      return Status::FromErrno("cannot read directory \"" + directory + "\"", ENOTDIR);
+    }
+    return Failure("cannot read directory", directory, error);
   }
   names->clear();
   do {
