@@ -27,6 +27,7 @@
 
 #include "alertmod/host_records.h"
 #include "alertmod/hostsvc/process_service.h"
+#include "alertmod/platform/testing/manual_env.h"
 #include "tests/support/fuzz_input.h"
 
 namespace {
@@ -188,7 +189,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   host.refuseStart = (mode & 1) != 0;
   host.refuseInput = (mode & 2) != 0;
   g_host = &host;
-  ipc::RegisterProcessService(kModuleId, &Send);
+  ipc::RegisterProcessService(kModuleId, &Send, nullptr, *hx::platform::SystemEnvForTests());
 
   std::string input(kInputSizes[(mode >> 2) & 7], '\0');
   for (size_t i = 0; i < input.size(); ++i) input[i] = static_cast<char>('a' + i % 23);

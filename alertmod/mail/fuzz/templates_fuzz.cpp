@@ -15,7 +15,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   item.sourceName = "{date}";
   item.profile.subject = text;
   item.profile.body = text.substr(size / 2);
-  if (hx::HasPlaceholders(text)) hx::ExpandTemplates(item, nullptr);
+  if (hx::HasPlaceholders(text)) hx::ExpandTemplates(item, nullptr, std::chrono::seconds(10));
   std::string address = text;
   hx::ExtractAddress(address);
   return 0;
