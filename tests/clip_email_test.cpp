@@ -120,7 +120,7 @@ class ClipEmailTest : public testsupport::ModuleHostTest {
     refhost::AlarmRequest::Source source;
     source.type = 2;  // motion
     request.source = source;
-    alarm.requests.push_back(request);
+    alarm.requests.push_back(std::move(request));
     host().WriteDocument(refhost::BuildAlarmDocument(alarm), 0x10000);
   }
 
