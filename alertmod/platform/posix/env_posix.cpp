@@ -1,14 +1,12 @@
 #include <ctime>
 
-#include "alertmod/platform/env.h"
-#include "alertmod/platform/file_system.h"
-#include "alertmod/platform/utc_time.h"
+#include "alertmod/platform/system_env.h"
 
 namespace hx {
 namespace platform {
 namespace {
 
-class PosixEnv final : public Env {
+class PosixEnv final : public SystemEnv {
  public:
   uint32_t TickMs() override {
     timespec now{};
@@ -20,32 +18,6 @@ class PosixEnv final : public Env {
     return static_cast<uint32_t>(ms);
   }
   int64_t WallSeconds() override { return static_cast<int64_t>(time(nullptr)); }
-
-  Status NewExclusiveFile(const std::string& path, File* file) override {
-    return File::CreateNew(path, file);
-  }
-  Status NewWritableFile(const std::string& path, bool append, File* file) override {
-    return File::OpenForWriting(path, append, file);
-  }
-  Status NewReadableFile(const std::string& path, File* file) override {
-    return File::OpenForReading(path, file);
-  }
-  Status RenameFile(const std::string& from, const std::string& to) override {
-    return RenameReplacing(from, to);
-  }
-  Status RemoveFile(const std::string& path) override { return DeleteFile(path); }
-  Status SyncParentDirectory(const std::string& path) override {
-    return platform::SyncParentDirectory(path);
-  }
-  Status FreeBytes(const std::string& directory, uint64_t* bytes) override {
-    return QueryFreeBytes(directory, bytes);
-  }
-  std::string TempDirectory() override { return TempDirectoryPath(); }
-
-  std::chrono::milliseconds WatchdogPeriod() override { return kDefaultWatchdogPeriod; }
-  std::chrono::milliseconds WebExchangeTimeout() override { return kDefaultWebExchangeTimeout; }
-  std::chrono::milliseconds ProcessStartTimeout() override { return kDefaultProcessStartTimeout; }
-  uint32_t InitialProcessIdCounter() override { return 0; }
 };
 
 }  // namespace
