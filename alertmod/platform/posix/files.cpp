@@ -23,22 +23,6 @@ std::string Quoted(const std::string& path) {
 
 }  // namespace
 
-File::~File() {
-  if (is_open()) Close();
-}
-
-File::File(File&& other) noexcept
-    : m_fd(std::exchange(other.m_fd, -1)), m_path(std::move(other.m_path)) {}
-
-File& File::operator=(File&& other) noexcept {
-  if (this != &other) {
-    if (is_open()) Close();
-    m_fd = std::exchange(other.m_fd, -1);
-    m_path = std::move(other.m_path);
-  }
-  return *this;
-}
-
 Status File::Open(const std::string& path, int flags, int mode, File* file) {
   int fd = open(path.c_str(), flags | O_CLOEXEC, mode);
   if (fd < 0) return Status::FromErrno("cannot open " + Quoted(path), errno);

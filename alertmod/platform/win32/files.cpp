@@ -52,22 +52,6 @@ HANDLE HandleOf(int fd) {
 
 }  // namespace
 
-File::~File() {
-  if (is_open()) Close();
-}
-
-File::File(File&& other) noexcept
-    : m_fd(std::exchange(other.m_fd, -1)), m_path(std::move(other.m_path)) {}
-
-File& File::operator=(File&& other) noexcept {
-  if (this != &other) {
-    if (is_open()) Close();
-    m_fd = std::exchange(other.m_fd, -1);
-    m_path = std::move(other.m_path);
-  }
-  return *this;
-}
-
 Status File::Open(const std::string& path, int flags, int /*mode*/, File* file) {
   const CreateArguments arguments = ArgumentsFor(flags);
   // Other handles may read, write, rename and delete the file meanwhile, as
